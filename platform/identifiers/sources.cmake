@@ -1,0 +1,3 @@
+target_sources(telvane_platform PRIVATE
+  ${CMAKE_CURRENT_LIST_DIR}/PersistentIdentifiers.cpp
+)

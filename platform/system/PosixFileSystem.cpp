@@ -1,0 +1,75 @@
+#include "platform/system/PosixFileSystem.h"
+
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdio>
+#include <filesystem>
+
+#include "platform/system/FileAccess.h"
+#include "platform/system/PlatformError.h"
+
+namespace telvane {
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr mode_t kFileMode = 0666;  // before the process's mask
+
+}  // namespace
+
+std::string PosixFileSystem::resolve(const std::string& path) const { return _paths.resolve(path); }
+
+Result<Data> PosixFileSystem::read(const std::string& path, uint64_t maximumSize) const {
+  Result<fileaccess::Content> content = fileaccess::read(resolve(path), maximumSize);
+  if (!content) return content.error();
+  return std::move(content->data);
+}
+
+Result<void> PosixFileSystem::writeAtomically(const std::string& path, const Data& data) {
+  return fileaccess::replace(resolve(path), data, kFileMode);
+}
+
+Result<void> PosixFileSystem::write(const std::string& path, const Data& data) {
+  return fileaccess::overwrite(resolve(path), data, kFileMode);
+}
+
+Result<void> PosixFileSystem::createDirectory(const std::string& path) {
+  return fileaccess::createDirectory(resolve(path));
+}
+
+Result<void> PosixFileSystem::remove(const std::string& path) {
+  const std::string resolved = resolve(path);
+  if (std::remove(resolved.c_str()) != 0) return errnoError(errno, "Cannot remove " + resolved);
+  return {};
+}
+
+std::optional<Date> PosixFileSystem::modificationDate(const std::string& path) const {
+  struct stat status {};
+  if (::stat(resolve(path).c_str(), &status) != 0) return std::nullopt;
+  const auto sinceEpoch =
+      std::chrono::seconds(status.st_mtim.tv_sec) + std::chrono::nanoseconds(status.st_mtim.tv_nsec);
+  return Date(Date::TimePoint(std::chrono::floor<std::chrono::microseconds>(sinceEpoch)));
+}
+
+Result<std::vector<std::string>> PosixFileSystem::filesBelow(const std::string& path) const {
+  const std::string folder = resolve(path);
+  std::error_code failure;
+  std::vector<std::string> files;
+  fs::recursive_directory_iterator entry(folder, fs::directory_options::skip_permission_denied, failure);
+  while (!failure && entry != fs::recursive_directory_iterator()) {
+    std::error_code gone;  // an entry may vanish while we look
+    if (entry->symlink_status(gone).type() == fs::file_type::regular) {
+      files.push_back(entry->path().lexically_relative(folder).string());
+    }
+    entry.increment(failure);
+  }
+  if (failure) return errnoError(failure.value(), "Cannot list " + folder);
+  std::sort(files.begin(), files.end());
+  return files;
+}
+
+Result<void> PosixFileSystem::setProtectionNone(const std::string&) { return {}; }
+
+}  // namespace telvane

@@ -1,0 +1,60 @@
+#pragma once
+
+#include <atomic>
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "platform/URLSession.h"
+#include "platform/url/UploadFile.h"
+
+namespace telvane {
+
+class CurlURLSession;
+
+// One request of a CurlURLSession, which keeps it from resume until it has completed. Its body is let go of when it has
+// completed, whoever still holds the task.
+//
+// The description is to be set before resume. The response belongs to the delegate queue.
+class CurlURLSessionTask final : public URLSessionTask, public std::enable_shared_from_this<CurlURLSessionTask> {
+ public:
+  // file: the body instead of the request's, or null.
+  CurlURLSessionTask(std::shared_ptr<CurlURLSession> session, URLRequest request, std::unique_ptr<UploadFile> file);
+
+  // Starts the task; a second call does nothing.
+  void resume() override;
+  void setTaskDescription(std::string description) override { _description = std::move(description); }
+  const std::string& taskDescription() const override { return _description; }
+  const std::optional<URLResponse>& response() const override { return _response; }
+
+  // For the session alone, from here on.
+
+  const URLRequest& request() const noexcept { return _request; }
+  const UploadFile* file() const noexcept { return _file.get(); }
+  // The size of what is sent, wherever it comes from.
+  uint64_t bodySize() const noexcept { return _file ? _file->size() : _request.body.size(); }
+  // The bytes of the body that are held in memory; constant, also when the body has gone.
+  uint64_t heldBytes() const noexcept { return _heldBytes; }
+  // REQUIRES: the task has completed; on the loop's thread.
+  void releaseBody();
+
+  // REQUIRES: on the delegate queue.
+  void setResponse(URLResponse response) { _response = std::move(response); }
+  bool isRefused() const noexcept { return _isRefused; }
+  void refuse() noexcept { _isRefused = true; }
+
+ private:
+  const std::shared_ptr<CurlURLSession> _session;
+  const uint64_t _heldBytes;
+  std::atomic<bool> _isResumed = false;
+  // Changed before resume only.
+  std::string _description;
+  // Read by the loop's thread after resume.
+  URLRequest _request;
+  std::unique_ptr<UploadFile> _file;
+  // Confined to the delegate queue.
+  std::optional<URLResponse> _response;
+  bool _isRefused = false;  // the delegate wants no more of it
+};
+
+}  // namespace telvane

@@ -1,0 +1,96 @@
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "foundation/Data.h"
+#include "foundation/Error.h"
+#include "platform/URLSession.h"
+
+namespace telvane {
+
+// A small HTTP/1.1 server, over TLS or plain, with kept connections. Owned by who started it; runs on threads of its
+// own until it is let go of, which closes all connections. Everything that a peer sends is bounded in size and time.
+class HTTPServer {
+ public:
+  using Header = URLRequest::Header;
+
+  struct Options {
+    std::string host = "127.0.0.1";  // an address, not a name
+    uint16_t port = 0;               // 0 picks a free one
+    // PEM files of the certificate with its chain and of its key; both empty: plain http.
+    std::string certificateFile;
+    std::string privateKeyFile;
+    // Answered with 413 and 431 when exceeded; the connection ends.
+    uint64_t maximumBodyBytes = 64ull << 20;
+    uint32_t maximumHeadBytes = 64u << 10;
+    // More are closed at once.
+    size_t maximumConnections = 1024;
+    // For a whole request from its first byte, for the TLS handshake, and for a peer to take a piece of the response.
+    std::chrono::milliseconds transferTimeout = std::chrono::seconds(60);
+    // Between requests.
+    std::chrono::milliseconds idleTimeout = std::chrono::seconds(120);
+    unsigned threads = 1;
+  };
+
+  struct Request {
+    std::string method;
+    std::string target;           // as sent, not decoded
+    std::vector<Header> headers;  // names as sent and in that order, those of one name side by side
+    Data body;                    // as sent, not decompressed
+    std::string peerAddress;      // HOST:PORT
+
+    // The value of the first header of that name, compared without regard to case; null when there is none.
+    const std::string* header(std::string_view name) const noexcept;
+  };
+
+  struct Response {
+    int status = 200;
+    // Content-Length, Transfer-Encoding and Connection are added; line breaks in names and values become blanks.
+    std::vector<Header> headers;
+    Data body;
+  };
+
+  // Takes the answer to one request, now or later, from any thread. Letting go of it without an answer ends the
+  // connection; so does an answer that is not finished. Calls after the end of the answer do nothing.
+  class Responder {
+   public:
+    virtual ~Responder() = default;
+    virtual void send(Response response) = 0;
+    // Sends the head alone; the body comes in pieces. length: what the head says, whatever comes then; absent: chunks.
+    virtual void sendHead(Response response, std::optional<uint64_t> length) = 0;
+    virtual void sendPiece(Data piece) = 0;
+    virtual void finish() = 0;
+    // Closes the connection where it stands.
+    virtual void close() = 0;
+  };
+
+  // Called on one of the server's threads for each request; while it runs, that thread serves nobody else.
+  using Handler = std::function<void(Request request, std::shared_ptr<Responder> responder)>;
+
+  // Opens the socket and starts to serve. Fails when the address or the certificate cannot be used.
+  static Result<std::unique_ptr<HTTPServer>> start(Options options, Handler handler);
+  // Closes everything and waits for the threads. Not from a handler.
+  ~HTTPServer();
+  HTTPServer(const HTTPServer&) = delete;
+  HTTPServer& operator=(const HTTPServer&) = delete;
+
+  // HOST:PORT, with the port that was picked.
+  const std::string& address() const noexcept;
+  uint16_t port() const noexcept;
+  // How many connections were accepted so far. Safe from any thread.
+  uint64_t acceptedConnections() const noexcept;
+
+ private:
+  class Core;
+  explicit HTTPServer(std::shared_ptr<Core> core);
+
+  const std::shared_ptr<Core> _core;
+};
+
+}  // namespace telvane
