@@ -1,0 +1,106 @@
+#include "backends/EventFilter.h"
+
+#include <algorithm>
+
+#include "backends/ListMatching.h"
+#include "backends/TelvaneBackend.h"
+#include "interfaces/EventKeys.h"
+#include "interfaces/StorebagKeys.h"
+
+namespace telvane {
+namespace {
+
+constexpr int32_t kAny = -1;
+constexpr std::string_view kRemove = "remove";
+constexpr std::string_view kSHA256 = "sha256";
+constexpr std::string_view kBlacklistValues = "blacklistValues";
+constexpr std::string_view kWhitelistValues = "whitelistValues";
+
+int32_t numberOrAny(const Value& value) noexcept { return value.isPresent() ? value.int32Value() : kAny; }
+
+// Digests are of text; any other value is digested as the text that describes it.
+String digestOf(const Value& value) {
+  return TelvaneBackend::convertIntoSHA256(value.isString() ? value.text() : std::string_view(description(value)));
+}
+
+}  // namespace
+
+EventFilter::EventFilter(const Array& entries) {
+  _records.reserve(entries.size());
+  for (const Value& entry : entries) {
+    const Dictionary* fields = entry.dictionary();
+    if (fields == nullptr || !(*fields)[kFilterKey].isString()) continue;
+    Record record{.method = numberOrAny((*fields)[kFilterMethod]),
+                  .status = numberOrAny((*fields)[kFilterStatus]),
+                  .action = actionForText((*fields)[kFilterAction].text()),
+                  .key = *(*fields)[kFilterKey].string(),
+                  .values = {}};
+    if (const Array* values = (*fields)[kFilterValue].array()) {
+      for (const Value& value : *values) {
+        if (value.isString()) record.values.push_back(*value.string());
+      }
+    }
+    _keyLengths |= lengthMark(record.key);
+    _records.push_back(std::move(record));
+  }
+}
+
+EventFilter::Action EventFilter::actionForText(std::string_view text) noexcept {
+  if (text == kRemove) return Action::Remove;
+  if (text == kSHA256) return Action::SHA256;
+  if (text == kBlacklistValues) return Action::BlacklistValues;
+  if (text == kWhitelistValues) return Action::WhitelistValues;
+  return Action::None;
+}
+
+uint64_t EventFilter::lengthMark(std::string_view key) noexcept {
+  return uint64_t{1} << std::min(key.size(), kLongestMarkedKey);
+}
+
+void EventFilter::filterEvent(Dictionary& event) const {
+  if (_records.empty()) return;
+  const int32_t method = event[kEventMethod].int32Value();
+  const int32_t status = event[kEventStatus].int32Value();
+  std::vector<Change> changes;
+  for (const DictionaryEntry& entry : event) {
+    if ((_keyLengths & lengthMark(entry.key)) == 0) continue;
+    const Record* record = firstRecordFor(entry.key, method, status);
+    if (record == nullptr) continue;
+    if (auto change = changeFor(*record, entry)) changes.push_back(*std::move(change));
+  }
+  for (Change& change : changes) event.set(change.key, std::move(change.replacement));
+}
+
+const EventFilter::Record* EventFilter::firstRecordFor(std::string_view key, int32_t method,
+                                                       int32_t status) const noexcept {
+  const auto found = std::find_if(_records.begin(), _records.end(), [=](const Record& record) {
+    return (record.method < 0 || record.method == method) && (record.status < 0 || record.status == status) &&
+           equalsIgnoringCase(record.key, key);
+  });
+  return found != _records.end() ? &*found : nullptr;
+}
+
+std::optional<EventFilter::Change> EventFilter::changeFor(const Record& record, const DictionaryEntry& entry) {
+  switch (record.action) {
+    case Action::None:
+      return std::nullopt;
+    case Action::Remove:
+      return Change{entry.key, {}};
+    case Action::SHA256:
+      return Change{entry.key, digestOf(entry.value)};
+    case Action::BlacklistValues:
+      if (entry.value.isString() && containsOneOf(entry.value, record.values)) return Change{entry.key, {}};
+      return std::nullopt;
+    case Action::WhitelistValues:
+      if (entry.value.isString() && !containsOneOf(entry.value, record.values)) return Change{entry.key, {}};
+      return std::nullopt;
+  }
+  return std::nullopt;
+}
+
+bool EventFilter::containsOneOf(const Value& value, const std::vector<String>& parts) noexcept {
+  return std::any_of(parts.begin(), parts.end(),
+                     [text = value.text()](const String& part) { return containsIgnoringCase(text, part); });
+}
+
+}  // namespace telvane

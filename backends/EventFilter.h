@@ -1,0 +1,57 @@
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string_view>
+#include <vector>
+
+#include "foundation/Value.h"
+
+namespace telvane {
+
+// The field filters of a storebag's client entry: what is taken out of events, or made unreadable, before they leave.
+// Prepared once, so that an event without anything to filter costs a look at the lengths of its keys. A value.
+class EventFilter {
+ public:
+  EventFilter() = default;
+  // entries: dictionaries with "method", "status", "key", "value" and "action", in the order in which they are tried.
+  // What is missing or of a wrong type: any method, any status, no key (which matches nothing), no texts, no action. An
+  // entry that is no dictionary is left out; a backend that must not report unfiltered looks for those before.
+  explicit EventFilter(const Array& entries);
+
+  bool empty() const noexcept { return _records.empty(); }
+  // Applies to each key the first record that fits it and the event's "_method" and "_status"; no other record touches
+  // that key, also when that one has no action.
+  void filterEvent(Dictionary& event) const;
+
+ private:
+  enum class Action : uint8_t { None, Remove, SHA256, BlacklistValues, WhitelistValues };
+
+  struct Record {
+    int32_t method;  // negative: any
+    int32_t status;  // negative: any
+    Action action;
+    String key;
+    std::vector<String> values;
+  };
+
+  // What is to be done to one key of an event.
+  struct Change {
+    String key;
+    Value replacement;  // absent: the key is removed
+  };
+
+  static constexpr size_t kLongestMarkedKey = 63;  // longer ones share a mark
+
+  static Action actionForText(std::string_view text) noexcept;
+  static uint64_t lengthMark(std::string_view key) noexcept;
+  static bool containsOneOf(const Value& value, const std::vector<String>& parts) noexcept;
+  const Record* firstRecordFor(std::string_view key, int32_t method, int32_t status) const noexcept;
+  // Returns what the record does to the key; nothing when all stays.
+  static std::optional<Change> changeFor(const Record& record, const DictionaryEntry& entry);
+
+  std::vector<Record> _records;
+  uint64_t _keyLengths = 0;  // one bit per length that a record's key has
+};
+
+}  // namespace telvane
