@@ -1,0 +1,130 @@
+// The health report of the stop message, and messages sent without a configured session.
+#include "daemon/session/TelvanedSession.h"
+#include "interfaces/ClientTypes.h"
+#include "interfaces/EventKeys.h"
+#include "interfaces/HealthKeys.h"
+#include "interfaces/SessionKeys.h"
+#include "platform/ProcessMemory.h"
+#include "util/DataHelpers.h"
+
+namespace telvane {
+namespace {
+
+constexpr std::string_view kUnknown = "Unknown";
+
+std::string_view shortNameOf(const Value& sessionInfo) {
+  const Dictionary* dictionary = sessionInfo.dictionary();
+  const ClientType* row =
+      dictionary != nullptr ? clientType((*dictionary)[kTelvaneSessionInfoClientType].int32Value()) : nullptr;
+  return row != nullptr ? row->senderName : kUnknown;
+}
+
+String perTypeKey(const Key& prefix, std::string_view shortName) {
+  return fmt::format("{}_{}", prefix.view(), shortName);
+}
+
+}  // namespace
+
+uint64_t TelvanedSession::batchedEventsSize() const {
+  uint64_t size = 0;
+  if (!_backends.has_value()) return size;
+  for (const auto& [name, backend] : *_backends) size += backend->batchedEventsSize();
+  return size;
+}
+
+uint64_t TelvanedSession::addSessionHealthInfo(const TelvanedSession& session, Dictionary& healthReport) const {
+  const std::string_view shortName = shortNameOf(session._sessionInfo);
+  const String sessionsKey = perTypeKey(kHealthSessionsCount, shortName);
+  healthReport.set(sessionsKey, Value(healthReport[sessionsKey.view()].integerValue() + 1));
+  const uint64_t size = session.batchedEventsSize();
+  const String batchKey = perTypeKey(kHealthBatchSize, shortName);
+  const int64_t current = healthReport[batchKey.view()].int32Value();
+  healthReport.set(batchKey, Value(static_cast<int64_t>(size) + current));
+  return size;
+}
+
+void TelvanedSession::addSessionsAccumulatedHealthInfoToPayload(
+    Dictionary& payload, const std::vector<std::shared_ptr<TelvanedSession>>& sessionList,
+    const Dictionary& storebags) const {
+  uint64_t memory = 0;
+  {
+    // Other sessions' infos and backends are written under this lock.
+    MonitorLock lock(_sessionDelegate->monitor());
+    for (const auto& session : sessionList) memory += addSessionHealthInfo(*session, payload);
+  }
+  memory += addSessionHealthInfo(*this, payload);
+  const uint32_t storebagsSize = objectSizeEstimate(Value(storebags));
+  payload.set(kHealthStorebagsCount, Value(storebags.size()));
+  payload.set(kHealthStorebagsSize, Value(storebagsSize));
+  payload.set(kHealthCalculatedMemoryUsage, Value(memory + storebagsSize));
+  payload.set(kHealthProcessMemoryUsage, Value(taskMemory()));
+}
+
+void TelvanedSession::sendMessageWithSessionInfo(Dictionary sessionInfo, Value userInfo, uint16_t category,
+                                                 uint16_t type, Dictionary payload,
+                                                 UniqueFunction<void(String)> reply) {
+  {
+    MonitorLock lock(_sessionDelegate->monitor());
+    _sessionInfo = sessionInfo;
+  }
+  const bool isOneTooMany = isRefused();
+  if (isOneTooMany) reply(fmt::format("Exceeded maximum active reporting session limit for userInfo='{}'", userInfo));
+  endIfRefused();
+  if (isOneTooMany) return;
+  if (!sessionInfo.contains(kTelvaneSessionInfoClientType) || !sessionInfo.contains(kTelvaneSessionInfoSessionID)) {
+    log().error("sendMessageWithSessionInfo: Could not retrieve identifiers from sessionInfo");
+    reply("Could not retrieve identifiers from sessionInfo");
+    return;
+  }
+  _sessionID = sessionInfo[kTelvaneSessionInfoSessionID].uint32Value();
+  setHierarchyFromSessionInfo();
+  _sessionDelegate->updateCorrelatedSessions(*this);
+  log().message("sendMessageWithSessionInfo: Sending message with session info for session {}", _sessionID);
+  const std::optional<Dictionary> storebag = _sessionDelegate->storebagForSession(*this);
+  if (!storebag.has_value()) {
+    reply("storebag not available");
+    return;
+  }
+  sendOneMessageWithSessionInfo(sessionInfo, userInfo, *storebag, category, type, payload);
+  reply("finished");
+}
+
+void TelvanedSession::sendOneMessageWithSessionInfo(const Dictionary& sessionInfo, const Value& userInfo,
+                                                    const Dictionary& storebag, uint16_t category, uint16_t type,
+                                                    const Dictionary& payload) {
+  log().message("sendOneMessageWithSessionInfo: Sending single message with sessionID {}",
+                sessionInfo[kTelvaneSessionInfoSessionID].integerValue());
+  if (!userInfo.isDictionary()) {
+    log().error("sendOneMessageWithSessionInfo: userInfo must be present and valid!!! Aborting method...");
+    return;
+  }
+  fillDeviceID();
+  createBackendsWithStorebag(storebag);
+  if (!_backends.has_value() || _backends->empty()) {
+    log().error("sendOneMessageWithSessionInfo: No backends available to send single message");
+    return;
+  }
+  receivedUserInfo(userInfo);
+  const Date now = _context.platform().clock.now();
+  for (const auto& [name, backend] : *_backends) {
+    backend->updateState();
+    backend->setReportingSessionConnectivityDelegate(_connectivityHelper);
+    if (isDropped(*backend, category, "sendOneMessageWithSessionInfo")) continue;
+    sendOneMessageToBackend(*backend, now, category, type, payload);
+  }
+}
+
+void TelvanedSession::sendOneMessageToBackend(TelvaneBackend& backend, Date timestamp, uint16_t category, uint16_t type,
+                                              const Dictionary& payload) {
+  constexpr uint32_t kOrdinary = 0;
+  Dictionary message = payload;
+  if (_context.isInternalBuild()) {
+    const auto serialNumber = _context.platform().deviceAnswers.answer(DeviceAnswers::kSerialNumber);
+    message.set(kEventSerialNum, serialNumber.has_value() ? Value(*serialNumber) : Value(kUnknown));
+  }
+  const std::optional<String> result = backend.sendMessage(message, timestamp, category, type, kOrdinary);
+  if (!result.has_value()) return;
+  _shared.messageLog.writeToLogFile("[{} -> sendOneMessageWithSessionInfo] {}", backend.name(), *result);
+}
+
+}  // namespace telvane
