@@ -1,0 +1,94 @@
+#include "client/ReportingQueue.h"
+
+namespace telvane {
+
+void ReportingQueue::async(Job step) {
+  bool mustSchedule = false;
+  {
+    MutexLock lock(_mutex);
+    _waiting.push_back(std::move(step));
+    mustSchedule = claimRun();
+  }
+  if (mustSchedule) scheduleRun();
+}
+
+void ReportingQueue::asyncBounded(Job step, uint64_t bytes, uint64_t ReportingQueue::*dropped) {
+  bool mustSchedule = false;
+  {
+    MutexLock lock(_mutex);
+    if (_bytes + bytes > kMaximumWaitingBytes) {
+      ++(this->*dropped);
+      return;
+    }
+    _bytes += bytes;
+    _waiting.push_back(std::move(step));
+    mustSchedule = claimRun();
+  }
+  if (mustSchedule) scheduleRun();
+}
+
+bool ReportingQueue::claimRun() {
+  if (_isBusy) return false;
+  _isBusy = true;
+  return true;
+}
+
+bool ReportingQueue::begin() {
+  MutexLock lock(_mutex);
+  return claimRun();
+}
+
+void ReportingQueue::end() {
+  {
+    MutexLock lock(_mutex);
+    if (_waiting.empty()) {
+      _isBusy = false;
+      return;
+    }
+  }
+  scheduleRun();
+}
+
+void ReportingQueue::scheduleRun() {
+  _queue->async([self = shared_from_this()] { self->run(); });
+}
+
+void ReportingQueue::run() {
+  for (std::vector<Job> steps = takeWaiting(); !steps.empty(); steps = takeWaiting()) {
+    for (Job& step : steps) {
+      // Taken out, so that what it holds goes when it is done and not with the whole list.
+      Job current = std::move(step);
+      current();
+    }
+  }
+}
+
+std::vector<Job> ReportingQueue::takeWaiting() {
+  std::vector<Job> steps;
+  uint64_t droppedMessages = 0;
+  uint64_t droppedNotices = 0;
+  {
+    MutexLock lock(_mutex);
+    steps.swap(_waiting);
+    _bytes -= _runningBytes;
+    _runningBytes = _bytes;
+    droppedMessages = std::exchange(_droppedMessages, 0);
+    droppedNotices = std::exchange(_droppedNotices, 0);
+    if (steps.empty()) _isBusy = false;
+  }
+  logDropped(droppedMessages, droppedNotices);
+  return steps;
+}
+
+void ReportingQueue::logDropped(uint64_t messages, uint64_t notices) {
+  if (messages > 0) {
+    _log.error("Dropped {} events: more than {} bytes were waiting to be handed to the daemon", messages,
+               kMaximumWaitingBytes);
+  }
+  if (notices > 0) {
+    _log.error("Dropped {} notices of filtered events: more than {} bytes were waiting to be handed to the delegate",
+               notices, kMaximumWaitingBytes);
+  }
+}
+
+}  // namespace telvane
