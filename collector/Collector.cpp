@@ -1,0 +1,77 @@
+#include "collector/Collector.h"
+
+#include <fmt/format.h>
+
+#include "platform/JSON.h"
+
+namespace telvane {
+namespace {
+
+constexpr std::string_view kStorebagsPath = "/storebags/";
+constexpr std::string_view kEventsPath = "/events";
+constexpr std::string_view kStatisticsPath = "/statistics";
+
+HTTPServer::Response textResponse(int status, std::string_view text) {
+  return {status, {{"Content-Type", "text/plain"}}, Data::copyOf(text)};
+}
+
+Error cannotServe(const CollectorOptions& options, const Error& reason) {
+  return Error::withDescription(
+      kPlatformErrorDomain, reason.code(),
+      fmt::format("cannot serve on {}:{} with the certificate {} and the key {}: {}", options.host, options.port,
+                  options.certificateFile, options.privateKeyFile, reason.description()));
+}
+
+std::string_view pathOf(std::string_view target) { return target.substr(0, target.find('?')); }
+
+}  // namespace
+
+Result<std::unique_ptr<Collector>> Collector::start(const CollectorOptions& options, FileSystem& files) {
+  std::unique_ptr<AppendFile> eventFile;
+  if (!options.eventFile.empty()) {
+    Result<std::unique_ptr<AppendFile>> opened = AppendFile::open(options.eventFile);
+    if (opened.has_error()) return opened.error();
+    eventFile = std::move(*opened);
+  }
+  std::unique_ptr<Collector> collector(new Collector(options, files, std::move(eventFile)));
+  HTTPServer::Options server;
+  server.host = options.host;
+  server.port = options.port;
+  server.certificateFile = options.certificateFile;
+  server.privateKeyFile = options.privateKeyFile;
+  Result<std::unique_ptr<HTTPServer>> started = HTTPServer::start(
+      std::move(server), [collector = collector.get()](HTTPServer::Request request,
+                                                       const std::shared_ptr<HTTPServer::Responder>& responder) {
+        responder->send(collector->answer(request));
+      });
+  if (started.has_error()) return cannotServe(options, started.error());
+  collector->_server = std::move(*started);
+  return collector;
+}
+
+Collector::Collector(const CollectorOptions& options, FileSystem& files, std::unique_ptr<AppendFile> eventFile)
+    : _storebags(files, options.storebagFolder, options.maxAge), _events(std::move(eventFile)) {}
+
+Collector::~Collector() = default;
+
+HTTPServer::Response Collector::answer(const HTTPServer::Request& request) {
+  const std::string_view path = pathOf(request.target);
+  const bool isGet = request.method == "GET";
+  if (path.starts_with(kStorebagsPath) && isGet) return _storebags.answer(path.substr(kStorebagsPath.size()), request);
+  if (path == kEventsPath && request.method == "POST") return _events.take(request);
+  if (path == kStatisticsPath && isGet) return statistics();
+  if (path.starts_with(kStorebagsPath) || path == kEventsPath || path == kStatisticsPath) {
+    return textResponse(405, "this method is not served here\n");
+  }
+  return textResponse(404, "nothing is served here\n");
+}
+
+HTTPServer::Response Collector::statistics() const {
+  Dictionary counts;
+  counts.set("events", Value(_events.events()));
+  counts.set("posts", Value(_events.posts()));
+  counts.set("bytes", Value(_events.bytes()));
+  return {200, {{"Content-Type", "application/json"}}, Data(json::serialize(counts).value())};
+}
+
+}  // namespace telvane

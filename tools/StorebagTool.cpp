@@ -1,0 +1,134 @@
+#include "tools/StorebagTool.h"
+
+#include <CLI/CLI.hpp>
+
+#include "interfaces/StorebagKeys.h"
+#include "platform/JSON.h"
+#include "platform/PropertyList.h"
+#include "platform/system/AppendFile.h"
+#include "storebag/StorebagVerification.h"
+#include "tools/StorebagEnvelope.h"
+
+namespace telvane {
+namespace {
+
+constexpr int kFailure = 1;
+constexpr int kWrongUsage = 2;
+constexpr char kName[] = "telvane-storebag";
+
+Error fault(const std::string& text) { return Error::withDescription("TelvaneStorebag", kFailure, text); }
+
+// Property lists hold more than JSON does; what JSON cannot show is shown as a property list.
+Result<std::string> readableText(const Dictionary& bag) {
+  Result<std::string> text = json::serialize(bag, json::Style::Pretty);
+  if (text.has_value()) return *text + "\n";
+  const Result<Data> xml = propertylist::serialize(bag, propertylist::Format::XML);
+  if (xml.has_error()) return xml.error();
+  return std::string(xml->view());
+}
+
+}  // namespace
+
+int StorebagTool::run(int argc, const char* const* argv) {
+  CLI::App app("Makes keys for storebags, signs bags, and verifies and shows signed ones.", kName);
+  app.set_version_flag("--version", "telvane-storebag " TELVANE_VERSION);
+  app.require_subcommand(1);
+  auto* keygen = app.add_subcommand("keygen", "make a key pair");
+  keygen->add_option("--private-key", _privateKeyFile, "new PEM file of the signing key")->required();
+  keygen->add_option("--public-key", _publicKeyFile, "DER file for the client bundle (publicKey.der)")->required();
+  auto* sign = app.add_subcommand("sign", "sign a bag for the server");
+  sign->add_option("--private-key", _privateKeyFile, "PEM file of the signing key")->required();
+  sign->add_option("--input", _inputFile, "the bag, a property list or JSON")->required();
+  sign->add_option("--output", _outputFile, "file for the signed envelope")->required();
+  auto* verify = app.add_subcommand("verify", "check an envelope's signature");
+  verify->add_option("--public-key", _publicKeyFile, "DER file of the public key")->required();
+  verify->add_option("ENVELOPE", _envelopeFile, "the signed envelope")->required();
+  auto* show = app.add_subcommand("show", "print the bag in an envelope, without believing it");
+  show->add_option("ENVELOPE", _envelopeFile, "the signed envelope")->required();
+  try {
+    app.parse(argc, argv);
+  } catch (const CLI::ParseError& error) {
+    if (error.get_exit_code() == 0) return app.exit(error, _output, _errors);
+    _errors << kName << ": " << error.what() << "; see telvane-storebag --help\n";
+    return kWrongUsage;
+  }
+  const Result<void> done = dispatch(app.get_subcommands().front()->get_name());
+  if (!done.has_error()) return 0;
+  _errors << kName << ": " << done.error().description() << "\n";
+  return kFailure;
+}
+
+Result<void> StorebagTool::dispatch(const std::string& command) {
+  if (command == "keygen") return keygen();
+  if (command == "sign") return sign();
+  if (command == "verify") return verify();
+  return show();
+}
+
+Result<void> StorebagTool::keygen() {
+  if (_files.modificationDate(_privateKeyFile).has_value()) {
+    return fault(_privateKeyFile + " exists already; remove it, or name another file for the private key");
+  }
+  const Result<crypto::PrivateKey> key = crypto::PrivateKey::generate();
+  if (key.has_error()) return key.error();
+  // Nobody but its owner may read a signing key.
+  const Result<std::unique_ptr<AppendFile>> file = AppendFile::open(_files.resolve(_privateKeyFile));
+  if (file.has_error()) return file.error();
+  const Result<void> written = (*file)->append(key->pem().view());
+  if (written.has_error()) return written.error();
+  return _files.writeAtomically(_publicKeyFile, key->publicKeyDER());
+}
+
+Result<void> StorebagTool::sign() {
+  const Result<Data> pem = readFile(_privateKeyFile);
+  if (pem.has_error()) return pem.error();
+  const Result<crypto::PrivateKey> key = crypto::PrivateKey::fromPEM(*pem);
+  if (key.has_error()) return fault(_privateKeyFile + ": " + key.error().description());
+  const Result<Data> text = readFile(_inputFile);
+  if (text.has_error()) return text.error();
+  const Result<Dictionary> bag = storebagenvelope::parseBag(*text);
+  if (bag.has_error()) return fault(_inputFile + ": " + bag.error().description());
+  if (!(*bag)[kStorebagVersion].isString()) {
+    return fault(_inputFile + ": the bag has no text under \"version\"; give it one, devices report it");
+  }
+  const Result<Data> envelope = storebagenvelope::seal(*bag, *key);
+  if (envelope.has_error()) return envelope.error();
+  return _files.writeAtomically(_outputFile, *envelope);
+}
+
+Result<void> StorebagTool::verify() {
+  const Result<Data> der = readFile(_publicKeyFile);
+  if (der.has_error()) return der.error();
+  const std::optional<crypto::PublicKey> key = crypto::PublicKey::fromDER(*der);
+  if (!key.has_value()) return fault(_publicKeyFile + " is no public RSA key in DER; make one with keygen");
+  const Result<Data> envelope = readFile(_envelopeFile);
+  if (envelope.has_error()) return envelope.error();
+  const Result<storebagenvelope::Content> content = storebagenvelope::open(*envelope);
+  if (content.has_error()) return fault(_envelopeFile + ": " + content.error().description());
+  if (!verifyStorebagSignature(*key, content->bag, content->signature)) {
+    return fault(_envelopeFile + ": the signature is not that of this key, or the bag was altered");
+  }
+  const Result<Dictionary> bag = storebagenvelope::parseSealedBag(*content);
+  if (bag.has_error()) return fault(_envelopeFile + ": " + bag.error().description());
+  _output << "the signature is good, version " << (*bag)[kStorebagVersion].text() << "\n";
+  return {};
+}
+
+Result<void> StorebagTool::show() {
+  const Result<Data> envelope = readFile(_envelopeFile);
+  if (envelope.has_error()) return envelope.error();
+  const Result<storebagenvelope::Content> content = storebagenvelope::open(*envelope);
+  if (content.has_error()) return fault(_envelopeFile + ": " + content.error().description());
+  const Result<Dictionary> bag = storebagenvelope::parseSealedBag(*content);
+  if (bag.has_error()) return fault(_envelopeFile + ": " + bag.error().description());
+  const Result<std::string> text = readableText(*bag);
+  if (text.has_error()) return text.error();
+  _output << *text;
+  return {};
+}
+
+Result<Data> StorebagTool::readFile(const std::string& path) const {
+  return _files.read(path, storebagenvelope::kMaximumFileBytes);
+}
+
+}  // namespace telvane
