@@ -1,0 +1,205 @@
+// Sessions that belong together.
+#include "tests/daemon/DaemonFixture.h"
+
+namespace telvane::testing {
+namespace {
+
+class TelvanedAgentHierarchyTest : public DaemonFixture {
+ protected:
+  // Opens one session per level in the hierarchy "a"; session IDs count from 1.
+  void givenLevels(std::initializer_list<int> levels, std::initializer_list<size_t> aggregating = {}) {
+    for (const int level : levels) {
+      const size_t index = clients.size();
+      const bool aggregates = std::find(aggregating.begin(), aggregating.end(), index) != aggregating.end();
+      clients.push_back(
+          openSession(sessionInfoIn("a", level, static_cast<uint32_t>(index + 1)), userInfo(), aggregates));
+    }
+    kept = sessions();
+  }
+  // Which of the kept sessions it is, counted from 1; 0 for none.
+  size_t numberOf(const TelvanedSession* session) const {
+    for (size_t i = 0; i < kept.size(); ++i) {
+      if (kept[i].get() == session) return i + 1;
+    }
+    return 0;
+  }
+  size_t parentOf(size_t number) { return numberOf(agent().parentSessionForChild(*kept[number - 1])); }
+  std::string idOf(size_t number) const { return kept[number - 1]->sessionIDString().str(); }
+  std::string chainOf(size_t number) {
+    const auto chain = agent().parentSessionIDStringForSession(*kept[number - 1]);
+    return chain.has_value() ? chain->str() : "none";
+  }
+  size_t aggregatorOf(size_t number) {
+    return numberOf(agent().getAncestorWithAggregatorForSession(*kept[number - 1]));
+  }
+  void close(size_t number) { clients[number - 1]->close(); }
+
+  std::vector<std::unique_ptr<DaemonClient>> clients;
+  std::vector<std::shared_ptr<TelvanedSession>> kept;
+
+  void TearDown() override {
+    kept.clear();
+    clients.clear();
+  }
+};
+
+TEST_F(TelvanedAgentHierarchyTest, theFirstSessionOfALevelStandsForItsSiblings) {
+  givenLevels({0, 1, 1, 2});
+  EXPECT_EQ(parentOf(2), 1u);
+  EXPECT_EQ(parentOf(3), 1u);
+  EXPECT_EQ(parentOf(4), 2u);
+  EXPECT_TRUE(hasLine(log(), "parentSessionForChild: Checking hierarchyToken 'a' for session 4"));
+}
+
+TEST_F(TelvanedAgentHierarchyTest, aTopSessionHasNeitherParentNorChain) {
+  givenLevels({0, 1});
+  EXPECT_EQ(parentOf(1), 0u);
+  EXPECT_EQ(chainOf(1), "none");
+  EXPECT_TRUE(hasNoLine(log(), "hierarchyToken 'a' for session 1"));
+}
+
+TEST_F(TelvanedAgentHierarchyTest, aSessionWithoutAHierarchyHasNeither) {
+  const auto client = openSession();
+  EXPECT_TRUE(hasLine(log(),
+                      "updateCorrelatedSessions: Session 42 has no correlated sessions as it is a standalone "
+                      "session"));
+  EXPECT_EQ(agent().parentSessionForChild(*sessions()[0]), nullptr);
+  EXPECT_EQ(agent().parentSessionIDStringForSession(*sessions()[0]), std::nullopt);
+}
+
+TEST_F(TelvanedAgentHierarchyTest, aChainNamesAllAncestorsFromTheTop) {
+  givenLevels({0, 1, 2, 3});
+  EXPECT_EQ(chainOf(2), idOf(1));
+  EXPECT_EQ(chainOf(4), idOf(1) + "." + idOf(2) + "." + idOf(3));
+}
+
+TEST_F(TelvanedAgentHierarchyTest, withoutItsParentASessionHasNoChain) {
+  givenLevels({0, 1, 2});
+  close(2);
+  EXPECT_EQ(parentOf(3), 0u);
+  EXPECT_EQ(chainOf(3), "none");
+  EXPECT_TRUE(
+      hasLine(log(), "parentSessionForChild: Unable to find session with hierarchy of 1 for hierarchyToken 'a'"));
+  EXPECT_TRUE(hasLine(log(),
+                      "parentSessionIDStringForSession: Found a gap in hierarchy (one of parents missing): "
+                      "incomplete parentSessionID is '(null)'"));
+}
+
+TEST_F(TelvanedAgentHierarchyTest, aGapFurtherUpLeavesThePartialChain) {
+  givenLevels({0, 1, 2});
+  close(1);
+  EXPECT_EQ(parentOf(3), 2u);
+  EXPECT_EQ(chainOf(3), idOf(2));
+  EXPECT_TRUE(hasLine(log(), "incomplete parentSessionID is '" + idOf(2) + "'"));
+}
+
+TEST_F(TelvanedAgentHierarchyTest, anUnfiledSessionIsAnErrorOfItsParentLookUp) {
+  givenLevels({0, 1});
+  close(2);
+  log().expectError("parentSessionForChild: ERROR: Session 2 not found for hierarchyToken a");
+  EXPECT_EQ(parentOf(2), 0u);
+  EXPECT_EQ(chainOf(2), "none");
+  EXPECT_TRUE(hasLine(log(), "parentSessionIDStringForSession: Session 2 not found for hierarchyToken a"));
+}
+
+TEST_F(TelvanedAgentHierarchyTest, aHierarchyWithoutSessionsIsAnError) {
+  givenLevels({1});
+  close(1);
+  log().expectError("parentSessionForChild: ERROR: No sessions found for hierarchyToken a");
+  log().expectError("parentSessionIDStringForSession: ERROR: No sessions found for hierarchyToken a");
+  EXPECT_EQ(parentOf(1), 0u);
+  EXPECT_EQ(chainOf(1), "none");
+}
+
+TEST_F(TelvanedAgentHierarchyTest, filingTwiceAddsOnce) {
+  givenLevels({0});
+  agent().updateCorrelatedSessions(*kept[0]);
+  close(1);
+  EXPECT_FALSE(openSession()->isInvalidated());
+  EXPECT_TRUE(hasLines(log(), 2, "as it has proper entitlement, 0(0) connections."));
+}
+
+TEST_F(TelvanedAgentHierarchyTest, aSessionThatChangesItsTokenLeavesTheOldOne) {
+  givenLevels({0, 1});
+  clients[0]->setSessionInfo(sessionInfoIn("b", 0, 1), userInfo());
+  EXPECT_EQ(parentOf(2), 0u);
+  EXPECT_TRUE(hasLine(log(),
+                      "updateCorrelatedSessions: Adding session 1 to list for hierarchyToken b with "
+                      "hierarchyLevel 0"));
+}
+
+TEST_F(TelvanedAgentHierarchyTest, theEmptyOldHierarchyStaysInTheRegistry) {
+  givenLevels({0});
+  clients[0]->setSessionInfo(sessionInfoIn("b", 0, 1), userInfo());
+  const auto next = connect();
+  EXPECT_TRUE(hasLine(log(), "as it has proper entitlement, 1(2) connections."));
+}
+
+TEST_F(TelvanedAgentHierarchyTest, theHighestAggregatingAncestorWins) {
+  givenLevels({0, 1, 2, 3}, {1, 2});
+  EXPECT_EQ(aggregatorOf(4), 2u);
+  EXPECT_EQ(aggregatorOf(3), 2u);
+  EXPECT_EQ(aggregatorOf(2), 0u);
+  EXPECT_EQ(aggregatorOf(1), 0u);
+}
+
+TEST_F(TelvanedAgentHierarchyTest, aSiblingThatDoesNotStandForItsLevelDoesNotAggregate) {
+  givenLevels({0, 1, 1, 2}, {2});
+  EXPECT_EQ(aggregatorOf(4), 0u);
+}
+
+TEST_F(TelvanedAgentHierarchyTest, onlyTheTopmostAggregatorStaysOpenAfterARefresh) {
+  givenStorebag();
+  givenLevels({0, 1, 2}, {0, 1, 2});
+  clients[0]->start();
+  EXPECT_TRUE(kept[0]->hasAggregator());
+  EXPECT_FALSE(kept[1]->hasAggregator());
+  EXPECT_FALSE(kept[2]->hasAggregator());
+  EXPECT_TRUE(hasLine(log(),
+                      "updateDownstreamSessions: Updating combined session ID and syncing reporting states for "
+                      "session 3"));
+  const Array theEnd{Value(), 0.0, 0, 0, Value()};
+  ASSERT_EQ(clients[1]->aggregated().size(), 1u);
+  EXPECT_EQ(clients[1]->aggregated()[0], theEnd);
+}
+
+TEST_F(TelvanedAgentHierarchyTest, aRefreshBelowAnAggregatingAncestorClosesItsOwnAggregator) {
+  givenStorebag();
+  givenLevels({0, 1, 2}, {0, 1, 2});
+  clients[1]->start();
+  EXPECT_TRUE(kept[0]->hasAggregator());
+  EXPECT_FALSE(kept[1]->hasAggregator());
+  EXPECT_FALSE(kept[2]->hasAggregator());
+}
+
+TEST_F(TelvanedAgentHierarchyTest, aTokenThatIsNoDictionaryMakesNoHierarchy) {
+  for (const Value& token : {Value("a"), Value(1), Value(Array{"a"}), Value(true)}) {
+    Dictionary info = sessionInfo();
+    info.set(kTelvaneSessionInfoHierarchyToken, token);
+    const auto client = openSession(info);
+    EXPECT_EQ(sessions().back()->hierarchyToken(), std::nullopt) << description(token);
+    EXPECT_EQ(sessions().back()->hierarchyLevel(), 0) << description(token);
+  }
+}
+
+TEST_F(TelvanedAgentHierarchyTest, aTokenWhoseTextIsMissingMakesNoHierarchy) {
+  for (const Value& text : {Value(), Value(5), Value(Array())}) {
+    Dictionary token{{kTelvaneHierarchyTokenLevel, 1}};
+    token.set(kTelvaneHierarchyTokenTokenID, text);
+    Dictionary info = sessionInfo();
+    info.set(kTelvaneSessionInfoHierarchyToken, token);
+    const auto client = openSession(info);
+    EXPECT_EQ(sessions().back()->hierarchyToken(), std::nullopt) << description(text);
+    EXPECT_EQ(agent().parentSessionForChild(*sessions().back()), nullptr) << description(text);
+  }
+}
+
+TEST_F(TelvanedAgentHierarchyTest, anAbsurdLevelCostsNoMoreThanTheSessionsThereAre) {
+  givenLevels({INT32_MAX, 0, INT32_MIN});
+  EXPECT_EQ(chainOf(1), "none");
+  EXPECT_EQ(aggregatorOf(1), 0u);
+  EXPECT_EQ(parentOf(3), 0u);
+}
+
+}  // namespace
+}  // namespace telvane::testing

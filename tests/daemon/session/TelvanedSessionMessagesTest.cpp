@@ -1,0 +1,235 @@
+// The road of a message through a session.
+#include "interfaces/ErrorCoding.h"
+#include "tests/daemon/DaemonFixture.h"
+#include "tests/support/RecordingConnectivity.h"
+
+namespace telvane::testing {
+namespace {
+
+class TelvanedSessionMessagesTest : public DaemonFixture {
+ protected:
+  static Dictionary message(Value category, Value type, Value payload = {}, Value flag = {}) {
+    Dictionary result;
+    result.set(kTelvaneMessageParametersCategory, std::move(category));
+    result.set(kTelvaneMessageParametersType, std::move(type));
+    result.set(kTelvaneMessageParametersPayload, std::move(payload));
+    result.set(kTelvaneMessageParametersFlag, std::move(flag));
+    return result;
+  }
+  // A session whose backends tell the client what they post, event by event.
+  std::unique_ptr<DaemonClient> startTalkativeSession() {
+    givenDefault(kTelvaneDefaultsSuite, kDefaultsForceEventLogging, true);
+    Dictionary info = sessionInfo();
+    info.set(kTelvaneSessionInfoBatchEvent, false);
+    return startSession(info);
+  }
+  static Error errorOf(const Answer& answer) {
+    const auto error = errorcoding::decode(answer[1]);
+    return error.has_value() ? *error : Error("none", 0);
+  }
+};
+
+TEST_F(TelvanedSessionMessagesTest, category0IsSent) {
+  givenStorebag();
+  const auto client = startSession();
+  client->send(0, 9);
+  client->flush();
+  EXPECT_EQ(postedEvents(0, 9).size(), 1u);
+  EXPECT_TRUE(hasLine(log(), "sendMessageWithDictionary: Sending message for session 42"));
+}
+
+TEST_F(TelvanedSessionMessagesTest, onlyTheLow16BitsOfNumbersCount) {
+  givenStorebag();
+  const auto client = startSession();
+  client->sendMessage(message(70000, 65537, Dictionary{{Key("k"), 1}}));
+  client->flush();
+  ASSERT_EQ(postedEvents(4464, 1).size(), 1u);
+  EXPECT_THAT(postedEvents(4464, 1)[0], HasEntry("k", 1));
+}
+
+TEST_F(TelvanedSessionMessagesTest, aMissingCategoryOrTypeDropsTheMessage) {
+  givenStorebag();
+  const auto client = startSession();
+  for (const Dictionary& incomplete : {message(Value(), 1), message(1, Value()), Dictionary()}) {
+    const Answer answer = client->sendMessage(incomplete);
+    ASSERT_TRUE(answer.values.has_value());
+    EXPECT_EQ(answer[0], Value());
+  }
+  EXPECT_TRUE(hasLines(log(), 2, "sendMessageWithDictionary: Missing mandatory parameter 'category'"));
+  EXPECT_TRUE(hasLines(log(), 1, "sendMessageWithDictionary: Missing mandatory parameter 'type'"));
+}
+
+TEST_F(TelvanedSessionMessagesTest, withoutBackendsNothingIsSent) {
+  const auto client = openSession();
+  EXPECT_EQ(client->send(7)[0], Value());
+  EXPECT_TRUE(hasLine(log(), "sendMessageWithDictionary: No backends available to send message"));
+}
+
+TEST_F(TelvanedSessionMessagesTest, aMissingFlagIsOrdinaryAndARealtimeOneGoesAtOnce) {
+  givenStorebag();
+  const auto client = startSession();
+  client->flush();
+  const size_t before = world.network().countTo(StorebagBuilder::kPostURL);
+  client->sendMessage(message(7, 1));
+  EXPECT_EQ(world.network().countTo(StorebagBuilder::kPostURL), before);
+  client->sendMessage(message(7, 2, Value(), 1));
+  EXPECT_EQ(postedEvents(7, 2).size(), 1u);
+}
+
+TEST_F(TelvanedSessionMessagesTest, aCategoryThatIsNotWhitelistedIsDroppedWithoutAReply) {
+  givenSection(StorebagBuilder::section("splunk", clientWith(kClientEntryEventWhitelist, Array{5})));
+  const auto client = startTalkativeSession();
+  EXPECT_EQ(client->send(7)[0], Value());
+  EXPECT_TRUE(hasLine(log(),
+                      "sendMessageWithDictionary: Dropping event with category 7 as it is not whitelisted for "
+                      "backend splunk"));
+  EXPECT_TRUE(client->send(5)[0].isString());
+  EXPECT_EQ(postedEvents(7, 1).size(), 0u);
+  EXPECT_EQ(postedEvents(5, 1).size(), 1u);
+}
+
+TEST_F(TelvanedSessionMessagesTest, aBlacklistedCategoryIsDroppedForThatBackendAlone) {
+  givenSection(sectionOf(
+      {{"splunk", clientWith(kClientEntryEventBlacklist, Array{7})}, {"gonzo", StorebagBuilder::permissiveClient()}}));
+  const auto client = startTalkativeSession();
+  client->send(7);
+  EXPECT_TRUE(hasLine(log(),
+                      "sendMessageWithDictionary: Dropping event with category 7 as it is blacklisted for "
+                      "backend splunk"));
+  EXPECT_EQ(postedEvents(7, 1).size(), 1u);
+}
+
+TEST_F(TelvanedSessionMessagesTest, theLastCollectorWithAResultAnswers) {
+  givenSection(sectionOf({{"splunk", StorebagBuilder::permissiveClient()},
+                          {"my_splunk_2", clientWith(kClientEntryEventBlacklist, Array{8})}}));
+  const auto client = startTalkativeSession();
+  const Answer first = client->send(7, 1, {{Key("k"), "v"}});
+  ASSERT_TRUE(first[0].isString()) << log().text();
+  EXPECT_TRUE(client->send(8)[0].isString());
+}
+
+TEST_F(TelvanedSessionMessagesTest, sendsToEveryBackend) {
+  givenSection(
+      sectionOf({{"splunk", StorebagBuilder::permissiveClient()}, {"gonzo", StorebagBuilder::permissiveClient()}}));
+  const auto client = startSession();
+  client->send(7);
+  client->flush();
+  EXPECT_EQ(postedEvents(7, 1).size(), 2u);
+}
+
+TEST_F(TelvanedSessionMessagesTest, flushingWithoutBackendsIsAnError) {
+  const auto client = openSession();
+  const Answer answer = client->flush();
+  EXPECT_EQ(answer[0], Value());
+  EXPECT_EQ(errorOf(answer).code(), -1);
+  EXPECT_EQ(errorOf(answer).description(), "No backends available to send message");
+  EXPECT_TRUE(hasLine(log(), "internalFlushMessagesWithCompletion: No backends available to send message"));
+}
+
+TEST_F(TelvanedSessionMessagesTest, aFlushAnswersOnceWithTheFirstError) {
+  givenSection(sectionOf({{"splunk", StorebagBuilder::permissiveClient()},
+                          {"splunk2", clientWith(kClientEntryEventWhitelist, Array{99})},
+                          {"gonzo", StorebagBuilder::permissiveClient()}}));
+  const auto client = startSession();
+  client->flush();
+  client->send(7);
+  const Answer answer = client->flush();
+  EXPECT_EQ(errorOf(answer).description(), "Nothing to flush");
+  world.advance(std::chrono::seconds(1));
+  EXPECT_TRUE(hasLines(log(), 2, "internalFlushMessagesWithCompletion: gonzo"));
+  EXPECT_EQ(postedEvents(7, 1).size(), 2u);
+}
+
+TEST_F(TelvanedSessionMessagesTest, aFlushAnswersWhenTheLastBackendIsDone) {
+  givenSection(sectionOf({{"splunk", StorebagBuilder::permissiveClient()},
+                          {"gonzo", clientWith(kClientEntryPostURL, "https://slow.example/")}}));
+  world.network().answer("https://slow.example/", NetworkAnswer::ok().after(std::chrono::seconds(5)));
+  const auto client = startSession();
+  const auto answer = client->askInPassing(ClientSessionOperation::FlushMessages);
+  world.advance(std::chrono::seconds(4));
+  EXPECT_FALSE(answer->values.has_value());
+  world.advance(std::chrono::seconds(2));
+  ASSERT_TRUE(answer->values.has_value());
+  EXPECT_EQ((*answer)[1], Value()) << errorOf(*answer).description();
+}
+
+TEST_F(TelvanedSessionMessagesTest, aServerErrorOfAFlushReachesTheClientAndDisablesTheBackend) {
+  givenStorebag();
+  world.network().answer(StorebagBuilder::kPostURL, NetworkAnswer::status(503));
+  log().allowErrors();
+  const auto client = startSession();
+  EXPECT_EQ(errorOf(client->flush()).code(), 503);
+  EXPECT_EQ(client->fetchStates(userInfo())[0], Value(Array()));
+}
+
+TEST_F(TelvanedSessionMessagesTest, uploadsThatNoBackendTakesFail) {
+  givenStorebag();
+  const auto client = startSession();
+  log().expectError("uploadFileWithURL: File upload failed for /tmp/log");
+  log().expectError("uploadLogData: Log data array upload failed");
+  EXPECT_EQ(client->ask(ClientSessionOperation::UploadFileAtPath, {"file:///tmp/log"})[0], Value(false));
+  const Answer answer = client->ask(ClientSessionOperation::UploadLogData, {Array{Value(Dictionary())}});
+  EXPECT_EQ(answer[0], Value(false));
+  EXPECT_EQ(answer[1], Value());
+  EXPECT_TRUE(hasLine(log(), "uploadFileAtPath: Uploading file for session 42"));
+}
+
+TEST_F(TelvanedSessionMessagesTest, theAggregatorHearsEveryMessageWithTheUserInfoAdded) {
+  givenStorebag();
+  const auto client = startSession(sessionInfo(), userInfo(), true);
+  client->send(7, 2, {{Key("k"), 1}, {kTelvaneUserInfoClientName, "forged"}});
+  ASSERT_EQ(client->aggregated().size(), 2u) << log().text();
+  const Array& heard = client->aggregated()[1];
+  EXPECT_EQ(heard[0], Value(sessionInfo()));
+  EXPECT_EQ(heard[1], Value(world.clock().now().secondsSince1970()));
+  EXPECT_EQ(heard[2], Value(7));
+  EXPECT_EQ(heard[3], Value(2));
+  Dictionary payload{{Key("k"), 1}};
+  payload.addEntriesFrom(userInfo());
+  EXPECT_EQ(heard[4], Value(payload));
+}
+
+TEST_F(TelvanedSessionMessagesTest, aMessageWithoutAPayloadIsAggregatedWithoutOne) {
+  givenStorebag();
+  const auto client = startSession(sessionInfo(), userInfo(), true);
+  client->sendMessage(message(7, 2));
+  ASSERT_EQ(client->aggregated().size(), 2u);
+  EXPECT_EQ(client->aggregated()[1][4], Value());
+}
+
+TEST_F(TelvanedSessionMessagesTest, theRootsAggregatorHearsAChildsMessagesAndTheChildsDoesNot) {
+  givenStorebag();
+  const auto root = startSession(sessionInfoIn("a", 0, 1), userInfo(), true);
+  const auto child = startSession(sessionInfoIn("a", 1, 2), userInfo(), true);
+  const size_t before = root->aggregated().size();
+  child->send(7);
+  ASSERT_EQ(root->aggregated().size(), before + 1);
+  EXPECT_EQ(root->aggregated().back()[0], Value(sessionInfoIn("a", 1, 2)));
+  // All that the child's own one heard is that it has ended.
+  for (const Array& call : child->aggregated()) EXPECT_EQ(call[2], Value(0));
+}
+
+TEST_F(TelvanedSessionMessagesTest, aSessionWithoutAnAggregatorAggregatesNothing) {
+  givenStorebag();
+  const auto client = startSession();
+  client->send(7);
+  EXPECT_TRUE(client->aggregated().empty());
+}
+
+TEST_F(TelvanedSessionMessagesTest, aDigestKeyReachesTheBackendOfThatNameAlone) {
+  givenSection(sectionOf({{"qrs", clientWith(kClientEntryPostURL, "https://digest.example/")},
+                          {"splunk", StorebagBuilder::permissiveClient()}}));
+  world.network().answer("https://digest.example/", NetworkAnswer::ok());
+  const auto client = startSession();
+  client->tell(ClientSessionOperation::SetDigestKey, {Data::copyOf("key"), 0});
+  client->flush();
+  const auto digested = world.network().requestsTo("https://digest.example/");
+  const auto plain = world.network().requestsTo(StorebagBuilder::kPostURL);
+  ASSERT_EQ(digested.size(), 1u);
+  ASSERT_EQ(plain.size(), 1u);
+  EXPECT_TRUE(RecordingConnectivity::header(digested[0].request, "X-TVN-DIGEST").has_value());
+  EXPECT_FALSE(RecordingConnectivity::header(plain[0].request, "X-TVN-DIGEST").has_value());
+}
+
+}  // namespace
+}  // namespace telvane::testing

@@ -1,0 +1,78 @@
+#pragma once
+
+#include <functional>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "foundation/Value.h"
+#include "platform/Crypto.h"
+#include "tests/support/ChildProcess.h"
+#include "tests/support/ScratchFolder.h"
+#include "tests/support/TestCertificates.h"
+
+namespace telvane::testing {
+
+// A whole Telvane in a scratch root: real daemon, real collector over TLS on loopback, real client processes. What the
+// operator would write (keys, bags, grants, settings) is written here.
+class Instance {
+ public:
+  Instance();
+  ~Instance();
+
+  // Configuration; to be given before the process that reads it starts.
+  // Signs the bag and publishes it under the name.
+  void givenStorebag(const std::string& name, const Dictionary& bag);
+  // Publishes these bytes as they are.
+  void givenStorebagFile(const std::string& name, std::string_view bytes);
+  std::string signedEnvelope(const Dictionary& bag) const;
+  // Where the daemon looks for storebags; the collector's by default.
+  void givenStorebagServer(const std::string& url);
+  void givenConsent(bool isGiven);
+  // Writes a file of the instance: "root/…" below TELVANE_ROOT, "home/…" in the user's home, "bundle/…".
+  void givenFile(const std::string& path, std::string_view content) { _scratch.write(path, content); }
+  std::string path(const std::string& name) const { return _scratch.at(name); }
+  // A grant for the event sender; without it, it is refused.
+  void grantEventSender();
+
+  // Processes.
+  void startCollector();
+  // Returns when the daemon serves, or has ended.
+  void startDaemon(const std::vector<std::string>& options = {"--log-level", "info"});
+  ChildProcess& daemon() { return *_daemon; }
+  // Starts another daemon on the same root, which is not waited for.
+  std::unique_ptr<ChildProcess> startSecondDaemon();
+  // Runs the event sender to its end and returns what it printed. See EventSender.cpp for its arguments.
+  std::string sendEvents(const std::vector<std::string>& arguments);
+  // Starts it; it ends when its input is closed. Its output goes to the file "sender.out".
+  std::unique_ptr<ChildProcess> startSender(const std::vector<std::string>& arguments);
+
+  std::string collectorURL(const std::string& path) const { return "https://" + _collectorAddress + path; }
+  // What has arrived so far: one line per event, as the collector writes it.
+  std::vector<Dictionary> arrived() const;
+  // The events that have arrived with this category.
+  std::vector<Dictionary> arrivedWithCategory(int64_t category) const;
+  std::string daemonLog() const { return _scratch.read("daemon.err"); }
+  std::string read(const std::string& name) const { return _scratch.read(name); }
+  bool daemonLogHas(std::string_view part) const { return daemonLog().find(part) != std::string::npos; }
+  std::string socketPath() const { return path("root/run/telvane/com.corvex.telvaned.socket"); }
+
+ private:
+  std::vector<std::string> environment() const;
+  void writeBundle();
+
+  ScratchFolder _scratch;
+  TestCertificates _certificates;
+  const crypto::PrivateKey _key;
+  std::string _collectorAddress;
+  std::unique_ptr<ChildProcess> _collector;
+  std::unique_ptr<ChildProcess> _daemon;
+};
+
+// Waits until the condition holds, for at most 20 s; returns whether it does.
+bool eventually(const std::function<bool()>& condition);
+
+// A bag with one HTTPS backend "splunk" that takes every client in the US and posts to the URL, consent or not.
+Dictionary openBag(const std::string& postURL);
+
+}  // namespace telvane::testing

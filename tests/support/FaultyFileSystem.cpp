@@ -1,0 +1,105 @@
+#include "tests/support/FaultyFileSystem.h"
+
+#include <cerrno>
+#include <cstring>
+#include <utility>
+
+namespace telvane::testing {
+
+namespace {
+
+Error failure(int errorNumber, const std::string& path) {
+  return Error::withDescription(kPlatformErrorDomain, errorNumber, path + ": " + std::strerror(errorNumber));
+}
+
+}  // namespace
+
+void FaultyFileSystem::failReads(int errorNumber, std::string pathPart) {
+  MutexLock lock(_mutex);
+  _readFaults.push_back(Fault{errorNumber, std::move(pathPart)});
+}
+
+void FaultyFileSystem::failWrites(int errorNumber, std::string pathPart) {
+  MutexLock lock(_mutex);
+  _writeFaults.push_back(Fault{errorNumber, std::move(pathPart)});
+}
+
+void FaultyFileSystem::fillDisk() {
+  MutexLock lock(_mutex);
+  _isDiskFull = true;
+}
+
+void FaultyFileSystem::heal() {
+  MutexLock lock(_mutex);
+  _readFaults.clear();
+  _writeFaults.clear();
+  _isDiskFull = false;
+}
+
+Result<Data> FaultyFileSystem::read(const std::string& path, uint64_t maximumSize) const {
+  if (auto fault = readFault(path)) return *std::move(fault);
+  return _target.read(path, maximumSize);
+}
+
+Result<void> FaultyFileSystem::writeAtomically(const std::string& path, const Data& data) {
+  if (auto fault = writeFault(path)) return *std::move(fault);
+  if (isDiskFull()) return failure(ENOSPC, path);
+  return _target.writeAtomically(path, data);
+}
+
+Result<void> FaultyFileSystem::write(const std::string& path, const Data& data) {
+  if (auto fault = writeFault(path)) return *std::move(fault);
+  if (!isDiskFull()) return _target.write(path, data);
+  auto written = _target.write(path, Data::copyOf(data.view().substr(0, data.size() / 2)));
+  if (!written) return written;
+  return failure(ENOSPC, path);
+}
+
+Result<void> FaultyFileSystem::createDirectory(const std::string& path) {
+  if (auto fault = writeFault(path)) return *std::move(fault);
+  if (isDiskFull() && !_target.modificationDate(path)) return failure(ENOSPC, path);
+  return _target.createDirectory(path);
+}
+
+Result<void> FaultyFileSystem::remove(const std::string& path) {
+  if (auto fault = writeFault(path)) return *std::move(fault);
+  return _target.remove(path);
+}
+
+std::optional<Date> FaultyFileSystem::modificationDate(const std::string& path) const {
+  if (readFault(path)) return std::nullopt;
+  return _target.modificationDate(path);
+}
+
+Result<std::vector<std::string>> FaultyFileSystem::filesBelow(const std::string& path) const {
+  if (auto fault = readFault(path)) return *std::move(fault);
+  return _target.filesBelow(path);
+}
+
+Result<void> FaultyFileSystem::setProtectionNone(const std::string& path) {
+  if (auto fault = writeFault(path)) return *std::move(fault);
+  return _target.setProtectionNone(path);
+}
+
+std::optional<Error> FaultyFileSystem::readFault(const std::string& path) const {
+  MutexLock lock(_mutex);
+  for (const Fault& fault : _readFaults) {
+    if (path.find(fault.pathPart) != std::string::npos) return failure(fault.errorNumber, path);
+  }
+  return std::nullopt;
+}
+
+std::optional<Error> FaultyFileSystem::writeFault(const std::string& path) const {
+  MutexLock lock(_mutex);
+  for (const Fault& fault : _writeFaults) {
+    if (path.find(fault.pathPart) != std::string::npos) return failure(fault.errorNumber, path);
+  }
+  return std::nullopt;
+}
+
+bool FaultyFileSystem::isDiskFull() const {
+  MutexLock lock(_mutex);
+  return _isDiskFull;
+}
+
+}  // namespace telvane::testing

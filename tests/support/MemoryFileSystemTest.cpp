@@ -1,0 +1,145 @@
+#include "tests/support/MemoryFileSystem.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <cerrno>
+
+#include "tests/support/FaultyFileSystem.h"
+#include "tests/support/Matchers.h"
+#include "tests/support/SimulatedClock.h"
+
+namespace telvane::testing {
+namespace {
+
+using namespace std::chrono_literals;
+using ::testing::ElementsAre;
+
+class MemoryFileSystemTest : public ::testing::Test {
+ protected:
+  SimulatedScheduler _scheduler{1};
+  SimulatedClock _clock{_scheduler};
+  MemoryFileSystem _files{_clock, "/root"};
+};
+
+TEST_F(MemoryFileSystemTest, resolvesTheHomeAndTheSystemsFolders) {
+  EXPECT_EQ(_files.resolve("~/Library/x"), "/home/user/Library/x");
+  EXPECT_EQ(_files.resolve("~"), "/home/user");
+  EXPECT_EQ(_files.resolve("/etc/telvane"), "/root/etc/telvane");
+  EXPECT_EQ(_files.resolve("/var/mobile//Library/"), "/root/var/mobile/Library");
+  EXPECT_EQ(_files.resolve("/tmp/tvnstorage/a"), "/root/tmp/tvnstorage/a");
+  EXPECT_EQ(_files.resolve("/tmp/else"), "/tmp/else");
+  EXPECT_EQ(_files.resolve("/variable"), "/variable");
+  EXPECT_EQ(MemoryFileSystem(_clock).resolve("/etc/telvane"), "/etc/telvane");
+}
+
+TEST_F(MemoryFileSystemTest, readsWhatWasWritten) {
+  EXPECT_TRUE(isOk(_files.createDirectory("/var/a/b")));
+  EXPECT_TRUE(isOk(_files.write("/var/a/b/file", Data::copyOf("one"))));
+  EXPECT_TRUE(isOk(_files.writeAtomically("/var/a/b/file", Data::copyOf("two"))));
+  const auto read = _files.read("/var/a/b/file", 3);
+  ASSERT_TRUE(isOk(read));
+  EXPECT_EQ(*read, Data::copyOf("two"));
+  EXPECT_TRUE(isError(_files.read("/var/a/b/file", 2), EFBIG));
+}
+
+TEST_F(MemoryFileSystemTest, failsAsADiskDoes) {
+  EXPECT_TRUE(isError(_files.read("/var/absent", 10), ENOENT));
+  EXPECT_TRUE(isError(_files.write("/var/absent/file", Data()), ENOENT));
+  _files.place("/var/file", "x");
+  EXPECT_TRUE(isError(_files.read("/var", 10), EISDIR));
+  EXPECT_TRUE(isError(_files.write("/var", Data()), EISDIR));
+  EXPECT_TRUE(isError(_files.write("/var/file/below", Data()), ENOTDIR));
+  EXPECT_TRUE(isError(_files.createDirectory("/var/file"), EEXIST));
+  EXPECT_TRUE(isError(_files.createDirectory("/var/file/below"), ENOTDIR));
+  EXPECT_TRUE(isOk(_files.createDirectory("/var")));
+  EXPECT_TRUE(isError(_files.remove("/var"), ENOTEMPTY));
+  EXPECT_TRUE(isError(_files.remove("/var/absent"), ENOENT));
+  EXPECT_TRUE(isError(_files.filesBelow("/var/absent"), ENOENT));
+  EXPECT_TRUE(isError(_files.filesBelow("/var/file"), ENOTDIR));
+  EXPECT_TRUE(isError(_files.setProtectionNone("/var/absent"), ENOENT));
+}
+
+TEST_F(MemoryFileSystemTest, removesFilesAndEmptyFolders) {
+  _files.place("/var/folder/file", "x");
+  EXPECT_TRUE(isOk(_files.remove("/var/folder/file")));
+  EXPECT_TRUE(isOk(_files.remove("/var/folder")));
+  EXPECT_FALSE(_files.exists("/var/folder"));
+  EXPECT_TRUE(_files.exists("/var"));
+}
+
+TEST_F(MemoryFileSystemTest, datesFilesByItsClock) {
+  _files.place("/var/file", "x");
+  const auto first = _files.modificationDate("/var/file");
+  EXPECT_EQ(first, _clock.now());
+  _scheduler.advance(10s);
+  EXPECT_EQ(_files.modificationDate("/var/file"), first);
+  EXPECT_TRUE(isOk(_files.writeAtomically("/var/file", Data())));
+  EXPECT_EQ(_files.modificationDate("/var/file"), _clock.now());
+  _files.setModificationDate("/var/file", Date());
+  EXPECT_EQ(_files.modificationDate("/var/file"), Date());
+  EXPECT_EQ(_files.modificationDate("/var/absent"), std::nullopt);
+}
+
+TEST_F(MemoryFileSystemTest, listsFilesBelowAFolderInOrder) {
+  for (const char* path : {"/var/b", "/var/a/z", "/var/a/b/c", "/variable"}) _files.place(path, "x");
+  const auto files = _files.filesBelow("/var");
+  ASSERT_TRUE(isOk(files));
+  EXPECT_THAT(*files, ElementsAre("a/b/c", "a/z", "b"));
+}
+
+TEST_F(MemoryFileSystemTest, remembersWhatIsUnprotected) {
+  _files.place("/var/file", "x");
+  EXPECT_TRUE(isOk(_files.setProtectionNone("/var/file")));
+  EXPECT_THAT(_files.unprotectedPaths(), ElementsAre("/root/var/file"));
+}
+
+class FaultyFileSystemTest : public MemoryFileSystemTest {
+ protected:
+  FaultyFileSystemTest() { _files.place("/var/file", "old content"); }
+  FaultyFileSystem _faulty{_files};
+};
+
+TEST_F(FaultyFileSystemTest, isNotFeltWithoutAFault) {
+  EXPECT_TRUE(isOk(_faulty.read("/var/file", 100)));
+  EXPECT_TRUE(isOk(_faulty.write("/var/file", Data::copyOf("new"))));
+  EXPECT_TRUE(isOk(_faulty.createDirectory("/var/folder")));
+  EXPECT_TRUE(isOk(_faulty.setProtectionNone("/var/folder")));
+  EXPECT_TRUE(isOk(_faulty.filesBelow("/var")));
+  EXPECT_TRUE(isOk(_faulty.remove("/var/folder")));
+  EXPECT_EQ(_files.content("/var/file"), "new");
+  EXPECT_EQ(_faulty.resolve("~"), _files.resolve("~"));
+}
+
+TEST_F(FaultyFileSystemTest, failsReadsOfSomePaths) {
+  _files.place("/var/other", "x");
+  _faulty.failReads(EACCES, "file");
+  EXPECT_TRUE(isError(_faulty.read("/var/file", 100), EACCES, "/var/file"));
+  EXPECT_EQ(_faulty.modificationDate("/var/file"), std::nullopt);
+  EXPECT_TRUE(isOk(_faulty.read("/var/other", 100)));
+  _faulty.heal();
+  EXPECT_TRUE(isOk(_faulty.read("/var/file", 100)));
+}
+
+TEST_F(FaultyFileSystemTest, failsWritesAndLeavesTheOldContent) {
+  _faulty.failWrites(EROFS);
+  EXPECT_TRUE(isError(_faulty.write("/var/file", Data()), EROFS));
+  EXPECT_TRUE(isError(_faulty.writeAtomically("/var/file", Data()), EROFS));
+  EXPECT_TRUE(isError(_faulty.createDirectory("/var/folder"), EROFS));
+  EXPECT_TRUE(isError(_faulty.remove("/var/file"), EROFS));
+  EXPECT_EQ(_files.content("/var/file"), "old content");
+}
+
+TEST_F(FaultyFileSystemTest, fillsTheDisk) {
+  _faulty.fillDisk();
+  EXPECT_TRUE(isError(_faulty.writeAtomically("/var/file", Data::copyOf("abcdef")), ENOSPC));
+  EXPECT_EQ(_files.content("/var/file"), "old content");
+  EXPECT_TRUE(isError(_faulty.write("/var/file", Data::copyOf("abcdef")), ENOSPC));
+  EXPECT_EQ(_files.content("/var/file"), "abc") << "a plain write leaves what fitted";
+  EXPECT_TRUE(isError(_faulty.createDirectory("/var/folder"), ENOSPC));
+  EXPECT_TRUE(isOk(_faulty.createDirectory("/var")));
+  EXPECT_TRUE(isOk(_faulty.remove("/var/file")));
+}
+
+}  // namespace
+}  // namespace telvane::testing
