@@ -65,4 +65,15 @@ Result<Dictionary> parseSealedBag(const Content& content) {
   return dictionaryOf(propertylist::parse(content.bag), "the bag in the envelope");
 }
 
+Result<FileContent> parseFile(const Data& bytes) {
+  Result<Dictionary> written = parseBag(bytes);
+  if (written.has_error()) return written.error();
+  if (!(*written)[kEnvelopeBag].isString()) return FileContent{.bag = std::move(*written)};
+  const Result<Content> content = open(bytes);
+  if (content.has_error()) return content.error();
+  Result<Dictionary> sealed = parseSealedBag(*content);
+  if (sealed.has_error()) return sealed.error();
+  return FileContent{.bag = std::move(*sealed), .isSigned = true};
+}
+
 }  // namespace telvane::storebagenvelope

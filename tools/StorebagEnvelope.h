@@ -29,4 +29,13 @@ Result<Content> open(const Data& envelope);
 // Reads the bag inside an envelope. Fails when it is no property list or no dictionary.
 Result<Dictionary> parseSealedBag(const Content& content);
 
+// A bag as a file held it.
+struct FileContent {
+  Dictionary bag;
+  bool isSigned = false;  // it came in an envelope, whose signature nobody has checked
+};
+// Reads whichever of the two the file is: an envelope when it is a property list with a text under "bag", otherwise a
+// bag as its author wrote it. Fails when it is neither.
+Result<FileContent> parseFile(const Data& bytes);
+
 }  // namespace telvane::storebagenvelope

@@ -78,6 +78,21 @@ TEST_F(StorebagEnvelopeTest, saysWhatAnEnvelopeLacks) {
   EXPECT_THAT(faultOf(plist(Dictionary{{kEnvelopeBag, "A"}, {kEnvelopeSignature, "AA=="}})), HasSubstr("no base64"));
 }
 
+TEST_F(StorebagEnvelopeTest, tellsByLookingWhetherAFileIsABagOrAnEnvelope) {
+  for (const std::string_view written : {std::string_view(kAsJSON), std::string_view(kAsXML)}) {
+    const storebagenvelope::FileContent plain = storebagenvelope::parseFile(Data::copyOf(written)).value();
+    EXPECT_FALSE(plain.isSigned);
+    EXPECT_EQ(plain.bag, bag());
+  }
+  const storebagenvelope::FileContent sealed = storebagenvelope::parseFile(seal()).value();
+  EXPECT_TRUE(sealed.isSigned);
+  EXPECT_EQ(sealed.bag, bag());
+  const auto broken = storebagenvelope::parseFile(Data(plist(Dictionary{{kEnvelopeBag, "AA=="}})));
+  ASSERT_TRUE(broken.has_error());
+  EXPECT_THAT(broken.error().description(), ::testing::HasSubstr("no text under \"signature\""));
+  EXPECT_TRUE(storebagenvelope::parseFile(Data::copyOf("garbage")).has_error());
+}
+
 TEST_F(StorebagEnvelopeTest, takesBase64WithLineBreaks) {
   const storebagenvelope::Content content = storebagenvelope::open(seal()).value();
   std::string wrapped = base64Encode({content.bag.bytes(), content.bag.size()});
