@@ -74,7 +74,7 @@ TEST_F(DaemonProcessTest, aSecondDaemonOnALiveSocketSaysSoAndExitsWithOne) {
 }
 
 TEST_F(DaemonProcessTest, refusesAClientWithoutTheEntitlement) {
-  std::filesystem::remove(instance.path("root/etc/telvane/entitlements.d/sender.plist"));
+  std::filesystem::remove(instance.path("root/etc/telvane/entitlements.d/telvane-event-sender.plist"));
   givenServingInstance();
   // Its configuration is never answered; it is not waited for.
   const auto sender = instance.startSender({"--no-flush"});

@@ -56,7 +56,7 @@ Instance::Instance() : _certificates(_scratch.path()), _key(crypto::PrivateKey::
   std::filesystem::create_directories(_scratch.at("storebags"));
   std::filesystem::create_directories(_scratch.at("home"));
   writeBundle();
-  grantEventSender();
+  grant("telvane-event-sender");
 }
 
 Instance::~Instance() = default;
@@ -69,13 +69,13 @@ void Instance::writeBundle() {
   _scratch.write("bundle/publicKey.der", _key.publicKeyDER().view());
 }
 
-void Instance::grantEventSender() {
+void Instance::grant(const std::string& programName) {
   Dictionary granted;
   granted.set(kTelvanedEntitlement, Value(true));
   Dictionary grant;
-  grant.set("executables", Array{Value(std::filesystem::canonical(program("telvane-event-sender")).string())});
+  grant.set("executables", Array{Value(std::filesystem::weakly_canonical(program(programName)).string())});
   grant.set("entitlements", granted);
-  _scratch.write("root/etc/telvane/entitlements.d/sender.plist", plist(Value(grant)));
+  _scratch.write("root/etc/telvane/entitlements.d/" + programName + ".plist", plist(Value(grant)));
 }
 
 std::string Instance::signedEnvelope(const Dictionary& bag) const {
@@ -112,13 +112,12 @@ std::vector<std::string> Instance::environment() const {
           "TZ=UTC"};
 }
 
-void Instance::startCollector() {
+void Instance::startCollector(const std::vector<std::string>& record) {
   const auto server = _certificates.valid();
-  _collector = std::make_unique<ChildProcess>(
-      std::vector<std::string>{program("telvane-collector"), "--listen", "127.0.0.1:0", "--certificate",
-                               server.certificateFile, "--private-key", server.privateKeyFile, "--storebags",
-                               path("storebags"), "--events", path("events.jsonl")},
-      environment(), ChildProcess::Files{path("collector.out"), path("collector.err")});
+  std::vector<std::string> arguments{"--listen",      "127.0.0.1:0",         "--certificate", server.certificateFile,
+                                     "--private-key", server.privateKeyFile, "--storebags",   path("storebags")};
+  arguments.insert(arguments.end(), record.begin(), record.end());
+  _collector = startProgram("telvane-collector", arguments, "collector");
   const bool isOpen = eventually([this] { return _scratch.read("collector.out").find('\n') != std::string::npos; });
   if (!isOpen) throw std::runtime_error("the collector does not start: " + _scratch.read("collector.err"));
   const std::string text = _scratch.read("collector.out");
@@ -126,28 +125,33 @@ void Instance::startCollector() {
   givenStorebagServer(collectorURL("/storebags"));
 }
 
+void Instance::launchDaemon(const std::vector<std::string>& options) {
+  _daemon.reset();
+  _daemon = startProgram("telvaned", options, "daemon");
+}
+
 void Instance::startDaemon(const std::vector<std::string>& options) {
-  std::vector<std::string> arguments{program("telvaned")};
-  arguments.insert(arguments.end(), options.begin(), options.end());
-  _daemon = std::make_unique<ChildProcess>(arguments, environment(),
-                                           ChildProcess::Files{path("daemon.out"), path("daemon.err")});
   const size_t before = daemonLog().size();
+  launchDaemon(options);
   eventually([this, before] {
     return !_daemon->isRunning() || daemonLog().find("Listener resumes", before) != std::string::npos;
   });
 }
 
-std::unique_ptr<ChildProcess> Instance::startSecondDaemon() {
-  return std::make_unique<ChildProcess>(std::vector<std::string>{program("telvaned")}, environment(),
-                                        ChildProcess::Files{path("second.out"), path("second.err")});
-}
+std::unique_ptr<ChildProcess> Instance::startSecondDaemon() { return startProgram("telvaned", {}, "second"); }
 
 std::unique_ptr<ChildProcess> Instance::startSender(const std::vector<std::string>& arguments) {
-  std::vector<std::string> all{program("telvane-event-sender")};
-  all.insert(all.end(), arguments.begin(), arguments.end());
   std::filesystem::remove(path("sender.out"));
+  return startProgram("telvane-event-sender", arguments, "sender");
+}
+
+std::unique_ptr<ChildProcess> Instance::startProgram(const std::string& programName,
+                                                     const std::vector<std::string>& arguments,
+                                                     const std::string& outputName) {
+  std::vector<std::string> all{program(programName)};
+  all.insert(all.end(), arguments.begin(), arguments.end());
   return std::make_unique<ChildProcess>(all, environment(),
-                                        ChildProcess::Files{path("sender.out"), path("sender.err")});
+                                        ChildProcess::Files{path(outputName + ".out"), path(outputName + ".err")});
 }
 
 std::string Instance::sendEvents(const std::vector<std::string>& arguments) {

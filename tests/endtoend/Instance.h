@@ -32,13 +32,20 @@ class Instance {
   // Writes a file of the instance: "root/…" below TELVANE_ROOT, "home/…" in the user's home, "bundle/…".
   void givenFile(const std::string& path, std::string_view content) { _scratch.write(path, content); }
   std::string path(const std::string& name) const { return _scratch.at(name); }
-  // A grant for the event sender; without it, it is refused.
-  void grantEventSender();
+  // A grant for a program of ours, by its name; without it, it is refused. The event sender has one from the start.
+  void grant(const std::string& programName);
+  // What a server of the test's own shows its clients, and what these trust.
+  TestCertificates::Server serverCertificate() { return _certificates.valid(); }
+  const std::string& authorityFile() const noexcept { return _certificates.authorityFile(); }
 
   // Processes.
-  void startCollector();
+  // record: what the collector does with events; it writes them to a file by default.
+  void startCollector() { startCollector({"--events", path("events.jsonl")}); }
+  void startCollector(const std::vector<std::string>& record);
   // Returns when the daemon serves, or has ended.
   void startDaemon(const std::vector<std::string>& options = {"--log-level", "info"});
+  // The same, but returns at once. The daemon before it is ended by then.
+  void launchDaemon(const std::vector<std::string>& options);
   ChildProcess& daemon() { return *_daemon; }
   // Starts another daemon on the same root, which is not waited for.
   std::unique_ptr<ChildProcess> startSecondDaemon();
@@ -46,6 +53,10 @@ class Instance {
   std::string sendEvents(const std::vector<std::string>& arguments);
   // Starts it; it ends when its input is closed. Its output goes to the file "sender.out".
   std::unique_ptr<ChildProcess> startSender(const std::vector<std::string>& arguments);
+
+  // Starts any program of ours in this instance; its output goes to the files "<outputName>.out" and ".err".
+  std::unique_ptr<ChildProcess> startProgram(const std::string& programName, const std::vector<std::string>& arguments,
+                                             const std::string& outputName);
 
   std::string collectorURL(const std::string& path) const { return "https://" + _collectorAddress + path; }
   // What has arrived so far: one line per event, as the collector writes it.

@@ -6,7 +6,6 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <chrono>
 #include <stdexcept>
 #include <thread>
 #include <utility>
@@ -14,7 +13,6 @@
 namespace telvane::testing {
 namespace {
 
-constexpr auto kPatience = std::chrono::seconds(60);
 constexpr auto kStep = std::chrono::milliseconds(2);
 
 std::vector<char*> pointers(const std::vector<std::string>& texts) {
@@ -78,9 +76,9 @@ bool ChildProcess::isRunning() {
   return false;
 }
 
-int ChildProcess::wait() {
+int ChildProcess::wait(std::chrono::milliseconds patience) {
   closeInput();
-  const auto deadline = std::chrono::steady_clock::now() + kPatience;
+  const auto deadline = std::chrono::steady_clock::now() + patience;
   while (isRunning()) {
     if (std::chrono::steady_clock::now() > deadline) signal(SIGKILL);
     std::this_thread::sleep_for(kStep);

@@ -2,6 +2,7 @@
 
 #include <sys/types.h>
 
+#include <chrono>
 #include <string>
 #include <vector>
 
@@ -26,9 +27,9 @@ class ChildProcess {
   void signal(int number);
   void closeInput();
   bool isRunning();
-  // Waits until it has ended, 60 s at most (it is killed then); returns the exit status, minus the signal's number when
-  // a signal ended it.
-  int wait();
+  // Waits until it has ended, so long at most (it is killed then); returns the exit status, minus the signal's number
+  // when a signal ended it.
+  int wait(std::chrono::milliseconds patience = std::chrono::seconds(60));
 
  private:
   pid_t _pid = -1;
