@@ -4,7 +4,7 @@
 #include <array>
 
 #include "backends/HTTPSPostBackend.h"
-#include "interfaces/BackendNames.h"
+#include "interfaces/BackendKind.h"
 #include "platform/Crypto.h"
 
 namespace telvane {
@@ -13,24 +13,15 @@ namespace {
 constexpr uint32_t kSamplingSteps = 10000;
 constexpr double kMicrosecondsPerSecond = 1e6;
 
-enum class Kind { Dashboard, UploadServer, HTTPSPost, Wattbook, VDR, Unknown };
-
 bool isDesktop(const ProcessContext& context) {
   const auto productType = context.platform().deviceAnswers.answer(DeviceAnswers::kProductType);
   return productType.has_value() && *productType == kDesktopProductType;
 }
 
-// The first rule that holds decides.
-Kind kindForName(const ProcessContext& context, const String& name) {
-  const std::string_view text = name;
-  if (text == kTelvaneBackendDashboard.view()) return Kind::Dashboard;
-  if (text == kTelvaneBackendUploadServer.view()) return Kind::UploadServer;
-  if (text.find(kTelvaneBackendHTTPPost.view()) != std::string_view::npos) return Kind::HTTPSPost;
-  if (text == kTelvaneBackendHTTPPost2.view()) return Kind::HTTPSPost;
-  if (text == kTelvaneBackendWattbook.view()) return Kind::Wattbook;
-  if (text == kTelvaneBackendQRS.view()) return Kind::HTTPSPost;
-  if (text == kTelvaneBackendVDR.view() && !isDesktop(context)) return Kind::VDR;
-  return Kind::Unknown;
+// The wireless-diagnostics service is not there on a desktop.
+BackendKind kindForName(const ProcessContext& context, std::string_view name) {
+  const BackendKind kind = backendKindForName(name);
+  return kind == BackendKind::VDR && isDesktop(context) ? BackendKind::Unknown : kind;
 }
 
 bool hasEntryFor(const Value& list, uint16_t method) noexcept {
@@ -46,13 +37,13 @@ std::shared_ptr<TelvaneBackend> TelvaneBackend::newBackendWithName(const Process
                                                                    const std::optional<String>& productFamily,
                                                                    uint32_t /*clientType*/) {
   switch (kindForName(context, name)) {
-    case Kind::HTTPSPost:
+    case BackendKind::HTTPSPost:
       return HTTPSPostBackend::initWithName(context, name, profile, productFamily);
-    case Kind::Dashboard:
-    case Kind::UploadServer:
-    case Kind::Wattbook:
-    case Kind::VDR:
-    case Kind::Unknown:
+    case BackendKind::Dashboard:
+    case BackendKind::UploadServer:
+    case BackendKind::Wattbook:
+    case BackendKind::VDR:
+    case BackendKind::Unknown:
       break;  // not built yet, or no backend at all
   }
   context.log().error("TelvaneBackend(newBackendWithName): {}", name);

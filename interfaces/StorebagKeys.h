@@ -2,7 +2,7 @@
 
 #include "foundation/Key.h"
 
-// The keys of a storebag: envelope, inner bag, environment sections, and the profile of one HTTPS backend.
+// The keys of a storebag: envelope, inner bag, environment sections, and the profiles of backends.
 namespace telvane {
 
 inline constexpr Key kEnvelopeBag{"bag"};
@@ -21,6 +21,10 @@ inline constexpr Key kEnvironmentRelease{"release"};
 inline constexpr Key kProfileActive{"active"};
 inline constexpr Key kProfileClients{"clients"};
 inline constexpr Key kProfileDisplayURL{"display_url"};
+inline constexpr Key kProfilePostURL{"post_url"};
+inline constexpr Key kProfileIP{"ip"};
+inline constexpr Key kProfilePort{"port"};
+inline constexpr Key kProfileReliable{"reliable"};
 
 inline constexpr Key kClientEntryClient{"client"};
 inline constexpr Key kClientEntryService{"service"};
