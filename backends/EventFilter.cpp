@@ -11,6 +11,7 @@ namespace telvane {
 namespace {
 
 constexpr int32_t kAny = -1;
+constexpr std::string_view kNone = "none";
 constexpr std::string_view kRemove = "remove";
 constexpr std::string_view kSHA256 = "sha256";
 constexpr std::string_view kBlacklistValues = "blacklistValues";
@@ -53,8 +54,39 @@ EventFilter::Action EventFilter::actionForText(std::string_view text) noexcept {
   return Action::None;
 }
 
+std::string_view EventFilter::textForAction(Action action) noexcept {
+  switch (action) {
+    case Action::None:
+      return kNone;
+    case Action::Remove:
+      return kRemove;
+    case Action::SHA256:
+      return kSHA256;
+    case Action::BlacklistValues:
+      return kBlacklistValues;
+    case Action::WhitelistValues:
+      return kWhitelistValues;
+  }
+  return kNone;
+}
+
 uint64_t EventFilter::lengthMark(std::string_view key) noexcept {
   return uint64_t{1} << std::min(key.size(), kLongestMarkedKey);
+}
+
+Array EventFilter::description() const {
+  Array descriptions;
+  descriptions.reserve(_records.size());
+  for (const Record& record : _records) {
+    Dictionary fields{{kFilterKey, record.key}, {kFilterAction, textForAction(record.action)}};
+    if (record.method >= 0) fields.set(kFilterMethod, record.method);
+    if (record.status >= 0) fields.set(kFilterStatus, record.status);
+    Array values;
+    for (const String& value : record.values) values.append(value);
+    if (!values.empty()) fields.set(kFilterValue, std::move(values));
+    descriptions.append(std::move(fields));
+  }
+  return descriptions;
 }
 
 void EventFilter::filterEvent(Dictionary& event) const {

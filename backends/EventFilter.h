@@ -20,6 +20,9 @@ class EventFilter {
   explicit EventFilter(const Array& entries);
 
   bool empty() const noexcept { return _records.empty(); }
+  // Tells what the records do, in the order in which they are tried: dictionaries with "key" and "action" ("none" for
+  // one that does nothing), and "method", "status" and "value" where they narrow it.
+  Array description() const;
   // Applies to each key the first record that fits it and the event's "_method" and "_status"; no other record touches
   // that key, also when that one has no action.
   void filterEvent(Dictionary& event) const;
@@ -44,6 +47,7 @@ class EventFilter {
   static constexpr size_t kLongestMarkedKey = 63;  // longer ones share a mark
 
   static Action actionForText(std::string_view text) noexcept;
+  static std::string_view textForAction(Action action) noexcept;
   static uint64_t lengthMark(std::string_view key) noexcept;
   static bool containsOneOf(const Value& value, const std::vector<String>& parts) noexcept;
   const Record* firstRecordFor(std::string_view key, int32_t method, int32_t status) const noexcept;

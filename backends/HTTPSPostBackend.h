@@ -80,19 +80,36 @@ class HTTPSPostBackend final : public TelvaneBackend {
   SessionNames sessionNames() const;
   void overrideBatching(const Array& clients, const SessionNames& names);
   uint32_t stateWithoutUserInfo(const Array& clients);
+  bool hasUserInfo() const;
+  // The entry that decides; null when there is none for this session.
+  const Dictionary* matchingEntry(const Array& clients, const SessionNames& names) const;
+  bool isMatchingEntry(const Value& entry, const SessionNames& names) const;
   uint32_t stateForClient(const Dictionary& client, const SessionNames& names);
-  bool matchClientNameAndServiceID(const Dictionary& client, const SessionNames& names) const;
+  static bool matchClientName(const Dictionary& client, const SessionNames& names);
+  static bool matchServiceID(const Dictionary& client, const SessionNames& names);
+  static bool matchClientNameAndServiceID(const Dictionary& client, const SessionNames& names);
   bool isFrameworkEnabledForClient(const Dictionary& client) const;
   bool isConsentEnough(const Dictionary& client);
   bool isCountryListed(const Dictionary& client, const std::optional<String>& country) const;
-  bool isDeviceAllowed(const Dictionary& client) const;
+  bool isProductFamilyListed(const Dictionary& client) const;
+  bool isHardwareRefused(const Dictionary& client) const;
   bool createFilters(const Dictionary& client);
   void takeSamplingThreshold(const Dictionary& client, const std::optional<String>& country);
+  void takeCountryThreshold(const Dictionary& client, const std::optional<String>& country);
   uint32_t sampledState(const Dictionary& client);
+  uint32_t overriddenSampledState(const Dictionary& client);
   void resetBackendStateWithClient(const Dictionary* client);
+  void takeCustomClientIdentifier(const Dictionary& client, const SessionNames& names);
   bool updatePostLink(const Dictionary& client);
   void updateRealtimePostLink(const Dictionary& client);
-  void takeListsAndSwitches(const Dictionary& client);
+  void takeLists(const Dictionary& client);
+  void takeSwitches(const Dictionary& client);
+  // Tell the gate observer, if there is one; what is only told is made only then. passes() returns isPassed.
+  void willLookAtEntry(std::optional<size_t> index) const;
+  template <class Tested>
+  void observe(Gate gate, GateOutcome outcome, const Tested& tested, const Value& against = Value::none()) const;
+  template <class Tested>
+  bool passes(Gate gate, bool isPassed, const Tested& tested, const Value& against = Value::none()) const;
 
   // Events.
   QueueState queueState() const;

@@ -6,6 +6,7 @@
 #include <string_view>
 #include <tuple>
 
+#include "backends/GateObserver.h"
 #include "connectivity/ReportingSessionConnectivityInterface.h"
 #include "foundation/Value.h"
 #include "platform/Dispatch.h"
@@ -111,6 +112,9 @@ class TelvaneBackend : public std::enable_shared_from_this<TelvaneBackend> {
   // Absent, or an array of numbers.
   const Value& eventWhitelist() const noexcept { return _eventWhitelist; }
   const Value& eventBlacklist() const noexcept { return _eventBlacklist; }
+  // Lets somebody hear how the next updateState() decides; null for nobody, which costs nothing. The observer outlives
+  // the backend, or is taken away before.
+  void setGateObserver(GateObserver* observer) noexcept { _gateObserver = observer; }
 
  protected:
   TelvaneBackend(const ProcessContext& context, String name, Dictionary profile, String productFamily);
@@ -162,6 +166,7 @@ class TelvaneBackend : public std::enable_shared_from_this<TelvaneBackend> {
   std::optional<String> _displayURL;
   Value _eventWhitelist;
   Value _eventBlacklist;
+  GateObserver* _gateObserver = nullptr;
   Value _digestKey;
   int32_t _digestAlgorithm = 0;
   std::weak_ptr<ReportingSessionConnectivityInterface> _reportingSessionConnectivityDelegate;
