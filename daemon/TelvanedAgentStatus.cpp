@@ -2,7 +2,7 @@
 #include "daemon/TelvanedAgent.h"
 #include "interfaces/AgentKeys.h"
 #include "interfaces/ClientTypes.h"
-#include "platform/ProcessMemory.h"
+#include "platform/ProcessIdentifier.h"
 
 namespace telvane {
 namespace {
@@ -27,7 +27,7 @@ Dictionary TelvanedAgent::daemonStatus() {
   status.set(kStatusVersion, _context.clientFrameworkVersion());
   status.set(kStatusProcessID, Value(currentProcessID()));
   status.set(kStatusUptimeSeconds, Value(uptime.count()));
-  status.set(kStatusMemoryBytes, Value(taskMemory()));
+  status.set(kStatusMemoryBytes, Value(platform.processMemory.taskMemory()));
   size_t helpers = 0;
   _stateQueue->sync([this, &helpers] {
     _stateQueue->assertOnQueue();

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstdint>
+#include <memory>
 #include <optional>
 #include <string>
 #include <vector>
@@ -8,6 +9,7 @@
 #include "foundation/Data.h"
 #include "foundation/Date.h"
 #include "foundation/Error.h"
+#include "platform/AppendableFile.h"
 
 namespace telvane {
 
@@ -24,10 +26,16 @@ class FileSystem {
   // Writes a file so that a reader sees the old or the new content, never a part (temporary file, fsync, rename).
   virtual Result<void> writeAtomically(const std::string& path, const Data& data) = 0;
   virtual Result<void> write(const std::string& path, const Data& data) = 0;
+  // Opens a regular file for adding at its end. Never makes one (ENOENT) and never opens what a symbolic link leads to
+  // (ELOOP).
+  virtual Result<std::unique_ptr<AppendableFile>> openForAppending(const std::string& path) = 0;
   // Creates the folder and those above it; fine when it exists.
   virtual Result<void> createDirectory(const std::string& path) = 0;
   virtual Result<void> remove(const std::string& path) = 0;
   virtual std::optional<Date> modificationDate(const std::string& path) const = 0;
+  // When the file or folder was made; a symbolic link is not followed. Nothing when there is none, or when the system
+  // does not tell.
+  virtual std::optional<Date> creationDate(const std::string& path) const = 0;
   // Paths of all regular files below the folder at any depth, relative to it, in ascending order; symbolic links are
   // not followed.
   virtual Result<std::vector<std::string>> filesBelow(const std::string& path) const = 0;

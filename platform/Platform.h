@@ -8,7 +8,9 @@
 #include "platform/FileSystem.h"
 #include "platform/Locale.h"
 #include "platform/Log.h"
+#include "platform/ProcessMemory.h"
 #include "platform/Random.h"
+#include "platform/SubmittableLogs.h"
 #include "platform/Transactions.h"
 #include "platform/URLSession.h"
 #include "platform/UserDefaults.h"
@@ -32,6 +34,8 @@ struct Platform {
   URLSessionProvider& urlSessions;
   Transactions& transactions;
   ipc::Service& localService;
+  SubmittableLogs& submittableLogs;
+  ProcessMemory& processMemory;
 };
 
 }  // namespace telvane

@@ -5,7 +5,7 @@
 #include "interfaces/ClientSessionInterface.h"
 #include "interfaces/SessionKeys.h"
 #include "platform/JSON.h"
-#include "platform/ProcessMemory.h"
+#include "platform/ProcessIdentifier.h"
 #include "tools/Answer.h"
 #include "tools/StatusText.h"
 

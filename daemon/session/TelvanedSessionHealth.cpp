@@ -4,7 +4,6 @@
 #include "interfaces/EventKeys.h"
 #include "interfaces/HealthKeys.h"
 #include "interfaces/SessionKeys.h"
-#include "platform/ProcessMemory.h"
 #include "util/DataHelpers.h"
 
 namespace telvane {
@@ -57,7 +56,7 @@ void TelvanedSession::addSessionsAccumulatedHealthInfoToPayload(
   payload.set(kHealthStorebagsCount, Value(storebags.size()));
   payload.set(kHealthStorebagsSize, Value(storebagsSize));
   payload.set(kHealthCalculatedMemoryUsage, Value(memory + storebagsSize));
-  payload.set(kHealthProcessMemoryUsage, Value(taskMemory()));
+  payload.set(kHealthProcessMemoryUsage, Value(_context.platform().processMemory.taskMemory()));
 }
 
 void TelvanedSession::sendMessageWithSessionInfo(Dictionary sessionInfo, Value userInfo, uint16_t category,

@@ -1,5 +1,6 @@
 #include "platform/system/PosixFileSystem.h"
 
+#include <fcntl.h>
 #include <sys/stat.h>
 
 #include <algorithm>
@@ -7,7 +8,9 @@
 #include <cstdio>
 #include <filesystem>
 
+#include "platform/system/AppendFile.h"
 #include "platform/system/FileAccess.h"
+#include "platform/system/FileTimes.h"
 #include "platform/system/PlatformError.h"
 
 namespace telvane {
@@ -35,6 +38,12 @@ Result<void> PosixFileSystem::write(const std::string& path, const Data& data) {
   return fileaccess::overwrite(resolve(path), data, kFileMode);
 }
 
+Result<std::unique_ptr<AppendableFile>> PosixFileSystem::openForAppending(const std::string& path) {
+  Result<std::unique_ptr<AppendFile>> file = AppendFile::openExisting(resolve(path));
+  if (!file) return file.error();
+  return std::unique_ptr<AppendableFile>(std::move(*file));
+}
+
 Result<void> PosixFileSystem::createDirectory(const std::string& path) {
   return fileaccess::createDirectory(resolve(path));
 }
@@ -51,6 +60,13 @@ std::optional<Date> PosixFileSystem::modificationDate(const std::string& path) c
   const auto sinceEpoch =
       std::chrono::seconds(status.st_mtim.tv_sec) + std::chrono::nanoseconds(status.st_mtim.tv_nsec);
   return Date(Date::TimePoint(std::chrono::floor<std::chrono::microseconds>(sinceEpoch)));
+}
+
+std::optional<Date> PosixFileSystem::creationDate(const std::string& path) const {
+  struct statx status {};
+  constexpr unsigned kTimes = STATX_BTIME | STATX_ATIME | STATX_MTIME;
+  if (::statx(AT_FDCWD, resolve(path).c_str(), AT_SYMLINK_NOFOLLOW, kTimes, &status) != 0) return std::nullopt;
+  return creationDateOf(status);
 }
 
 Result<std::vector<std::string>> PosixFileSystem::filesBelow(const std::string& path) const {

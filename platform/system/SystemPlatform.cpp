@@ -8,11 +8,13 @@
 #include "platform/system/DefaultsConsent.h"
 #include "platform/system/Environment.h"
 #include "platform/system/FolderClientBundle.h"
+#include "platform/system/FolderSubmittableLogs.h"
 #include "platform/system/Paths.h"
 #include "platform/system/PosixFileSystem.h"
 #include "platform/system/PropertyListUserDefaults.h"
 #include "platform/system/SystemDeviceAnswers.h"
 #include "platform/system/SystemLocale.h"
+#include "platform/system/SystemProcessMemory.h"
 #include "platform/url/CurlURLSessionProvider.h"
 
 namespace telvane {
@@ -29,10 +31,11 @@ struct SystemPlatform::Parts {
         consent(userDefaults, log),
         clientBundle(FolderClientBundle::folderFor(environment, paths), log),
         urlSessions(dispatch, log, &flowGate, {.caFile = environment.certificates.value_or("")}),
+        submittableLogs(paths),
         entitlements(files, log),
         localService(files, dispatch, log, entitlements, &flowGate),
-        platform{clock,  random,  dispatch,     log,         files,        userDefaults, deviceAnswers,
-                 locale, consent, clientBundle, urlSessions, transactions, localService} {}
+        platform{clock,   random,       dispatch,    log,          files,        userDefaults,    deviceAnswers, locale,
+                 consent, clientBundle, urlSessions, transactions, localService, submittableLogs, processMemory} {}
 
   SystemClock clock;
   SystemRandom random;
@@ -46,6 +49,8 @@ struct SystemPlatform::Parts {
   DefaultsConsent consent;
   FolderClientBundle clientBundle;
   CurlURLSessionProvider urlSessions;
+  FolderSubmittableLogs submittableLogs;
+  SystemProcessMemory processMemory;
   ipc::Entitlements entitlements;
   ipc::SocketService localService;
   const Platform platform;

@@ -8,13 +8,15 @@ target_sources(telvane_platform PRIVATE
   ${CMAKE_CURRENT_LIST_DIR}/Environment.cpp
   ${CMAKE_CURRENT_LIST_DIR}/FileAccess.cpp
   ${CMAKE_CURRENT_LIST_DIR}/FileDescriptor.cpp
+  ${CMAKE_CURRENT_LIST_DIR}/FileTimes.cpp
   ${CMAKE_CURRENT_LIST_DIR}/FolderClientBundle.cpp
+  ${CMAKE_CURRENT_LIST_DIR}/FolderSubmittableLogs.cpp
   ${CMAKE_CURRENT_LIST_DIR}/JSONParser.cpp
   ${CMAKE_CURRENT_LIST_DIR}/JSONWriter.cpp
   ${CMAKE_CURRENT_LIST_DIR}/Paths.cpp
   ${CMAKE_CURRENT_LIST_DIR}/PlatformError.cpp
   ${CMAKE_CURRENT_LIST_DIR}/PosixFileSystem.cpp
-  ${CMAKE_CURRENT_LIST_DIR}/ProcessMemory.cpp
+  ${CMAKE_CURRENT_LIST_DIR}/ProcessIdentifier.cpp
   ${CMAKE_CURRENT_LIST_DIR}/ProcessTransactions.cpp
   ${CMAKE_CURRENT_LIST_DIR}/PropertyList.cpp
   ${CMAKE_CURRENT_LIST_DIR}/PropertyListBinaryScan.cpp
@@ -26,6 +28,7 @@ target_sources(telvane_platform PRIVATE
   ${CMAKE_CURRENT_LIST_DIR}/SystemDeviceAnswers.cpp
   ${CMAKE_CURRENT_LIST_DIR}/SystemLocale.cpp
   ${CMAKE_CURRENT_LIST_DIR}/SystemPlatform.cpp
+  ${CMAKE_CURRENT_LIST_DIR}/SystemProcessMemory.cpp
   ${CMAKE_CURRENT_LIST_DIR}/TerminationSignals.cpp
   ${CMAKE_CURRENT_LIST_DIR}/UTF8.cpp
 )

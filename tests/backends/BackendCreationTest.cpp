@@ -155,7 +155,9 @@ TEST_F(BackendCreationTest, allBackendsOfACallStartAtTheSameTime) {
                    base.clientBundle,
                    base.urlSessions,
                    base.transactions,
-                   base.localService};
+                   base.localService,
+                   base.submittableLogs,
+                   base.processMemory};
   const ProcessContext tickingContext{ticking};
   const Dictionary both{{Key("splunk"), profile()}, {Key("gonzo"), profile()}};
   const auto table = createBackends(tickingContext, both, _sessionInfo, _userInfo, "device-id");

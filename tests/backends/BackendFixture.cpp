@@ -16,7 +16,8 @@ Platform withRandom(const Platform& platform, Random& random) {
           platform.deviceAnswers, platform.locale,
           platform.consent,       platform.clientBundle,
           platform.urlSessions,   platform.transactions,
-          platform.localService};
+          platform.localService,  platform.submittableLogs,
+          platform.processMemory};
 }
 
 }  // namespace

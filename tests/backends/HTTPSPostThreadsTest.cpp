@@ -38,10 +38,21 @@ class HTTPSPostThreadsTest : public BackendFixture {
   }
 
   Platform threadedPlatform(const Platform& base) {
-    return {_clock,           base.random,       _dispatch,          _log,
-            base.files,       base.userDefaults, base.deviceAnswers, base.locale,
-            base.consent,     base.clientBundle, base.urlSessions,   base.transactions,
-            base.localService};
+    return {_clock,
+            base.random,
+            _dispatch,
+            _log,
+            base.files,
+            base.userDefaults,
+            base.deviceAnswers,
+            base.locale,
+            base.consent,
+            base.clientBundle,
+            base.urlSessions,
+            base.transactions,
+            base.localService,
+            base.submittableLogs,
+            base.processMemory};
   }
 
   SystemClock _clock;

@@ -14,6 +14,22 @@ Error failure(int errorNumber, const std::string& path) {
 
 }  // namespace
 
+class FaultyFileSystem::OpenFile final : public AppendableFile {
+ public:
+  OpenFile(const FaultyFileSystem& files, std::string path, std::unique_ptr<AppendableFile> target)
+      : _files(files), _path(std::move(path)), _target(std::move(target)) {}
+  Result<void> append(std::string_view text) override {
+    if (auto fault = _files.writeFault(_path)) return *std::move(fault);
+    if (_files.isDiskFull()) return failure(ENOSPC, _path);
+    return _target->append(text);
+  }
+
+ private:
+  const FaultyFileSystem& _files;
+  const std::string _path;
+  const std::unique_ptr<AppendableFile> _target;
+};
+
 void FaultyFileSystem::failReads(int errorNumber, std::string pathPart) {
   MutexLock lock(_mutex);
   _readFaults.push_back(Fault{errorNumber, std::move(pathPart)});
@@ -55,6 +71,13 @@ Result<void> FaultyFileSystem::write(const std::string& path, const Data& data) 
   return failure(ENOSPC, path);
 }
 
+Result<std::unique_ptr<AppendableFile>> FaultyFileSystem::openForAppending(const std::string& path) {
+  if (auto fault = writeFault(path)) return *std::move(fault);
+  Result<std::unique_ptr<AppendableFile>> opened = _target.openForAppending(path);
+  if (!opened) return opened;
+  return std::unique_ptr<AppendableFile>(std::make_unique<OpenFile>(*this, path, std::move(*opened)));
+}
+
 Result<void> FaultyFileSystem::createDirectory(const std::string& path) {
   if (auto fault = writeFault(path)) return *std::move(fault);
   if (isDiskFull() && !_target.modificationDate(path)) return failure(ENOSPC, path);
@@ -69,6 +92,11 @@ Result<void> FaultyFileSystem::remove(const std::string& path) {
 std::optional<Date> FaultyFileSystem::modificationDate(const std::string& path) const {
   if (readFault(path)) return std::nullopt;
   return _target.modificationDate(path);
+}
+
+std::optional<Date> FaultyFileSystem::creationDate(const std::string& path) const {
+  if (readFault(path)) return std::nullopt;
+  return _target.creationDate(path);
 }
 
 Result<std::vector<std::string>> FaultyFileSystem::filesBelow(const std::string& path) const {

@@ -29,13 +29,17 @@ class FaultyFileSystem final : public FileSystem {
   Result<Data> read(const std::string& path, uint64_t maximumSize) const override;
   Result<void> writeAtomically(const std::string& path, const Data& data) override;
   Result<void> write(const std::string& path, const Data& data) override;
+  // The file that it opens feels the faults too, also those that come later.
+  Result<std::unique_ptr<AppendableFile>> openForAppending(const std::string& path) override;
   Result<void> createDirectory(const std::string& path) override;
   Result<void> remove(const std::string& path) override;
   std::optional<Date> modificationDate(const std::string& path) const override;
+  std::optional<Date> creationDate(const std::string& path) const override;
   Result<std::vector<std::string>> filesBelow(const std::string& path) const override;
   Result<void> setProtectionNone(const std::string& path) override;
 
  private:
+  class OpenFile;
   struct Fault {
     int errorNumber;
     std::string pathPart;

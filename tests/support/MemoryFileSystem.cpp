@@ -24,6 +24,17 @@ bool isBelow(const std::string& path, const std::string& folder) {
 
 }  // namespace
 
+// An open file by its name: one that is removed meanwhile cannot be added to.
+class MemoryFileSystem::OpenFile final : public AppendableFile {
+ public:
+  OpenFile(MemoryFileSystem& files, std::string resolved) : _files(files), _resolved(std::move(resolved)) {}
+  Result<void> append(std::string_view text) override { return _files.append(_resolved, text); }
+
+ private:
+  MemoryFileSystem& _files;
+  const std::string _resolved;
+};
+
 MemoryFileSystem::MemoryFileSystem(const Clock& clock, std::string root) : _clock(clock), _root(std::move(root)) {
   MutexLock lock(_mutex);
   addFolders(kHome);
@@ -67,7 +78,30 @@ Result<void> MemoryFileSystem::store(const std::string& path, const Data& data) 
     return failure(_files.count(parentOf(resolved)) != 0 ? ENOTDIR : ENOENT, path);
   }
   if (_files.count(resolved) == 0) folder->second = _clock.now();
-  _files[resolved] = File{data, _clock.now()};
+  setContent(resolved, data);
+  return {};
+}
+
+void MemoryFileSystem::setContent(const std::string& resolved, const Data& data) {
+  const auto found = _files.find(resolved);
+  const std::optional<Date> created = found != _files.end() ? found->second.created : _clock.now();
+  _files[resolved] = File{data, _clock.now(), created};
+}
+
+Result<std::unique_ptr<AppendableFile>> MemoryFileSystem::openForAppending(const std::string& path) {
+  std::string resolved = resolve(path);
+  MutexLock lock(_mutex);
+  if (_folders.count(resolved) != 0) return failure(EISDIR, path);
+  if (_files.count(resolved) == 0) return failure(ENOENT, path);
+  return std::unique_ptr<AppendableFile>(std::make_unique<OpenFile>(*this, std::move(resolved)));
+}
+
+Result<void> MemoryFileSystem::append(const std::string& resolved, std::string_view text) {
+  MutexLock lock(_mutex);
+  const auto found = _files.find(resolved);
+  if (found == _files.end()) return failure(ENOENT, resolved);
+  found->second.content = Data(std::string(found->second.content.view()).append(text));
+  found->second.modified = _clock.now();
   return {};
 }
 
@@ -105,6 +139,14 @@ std::optional<Date> MemoryFileSystem::modificationDate(const std::string& path) 
   return std::nullopt;
 }
 
+std::optional<Date> MemoryFileSystem::creationDate(const std::string& path) const {
+  const std::string resolved = resolve(path);
+  MutexLock lock(_mutex);
+  if (const auto found = _files.find(resolved); found != _files.end()) return found->second.created;
+  if (const auto found = _folders.find(resolved); found != _folders.end()) return found->second;
+  return std::nullopt;
+}
+
 Result<std::vector<std::string>> MemoryFileSystem::filesBelow(const std::string& path) const {
   const std::string resolved = resolve(path);
   MutexLock lock(_mutex);
@@ -129,7 +171,18 @@ void MemoryFileSystem::place(const std::string& path, std::string_view content) 
   const std::string resolved = resolve(path);
   MutexLock lock(_mutex);
   addFolders(parentOf(resolved));
-  _files[resolved] = File{Data::copyOf(content), _clock.now()};
+  setContent(resolved, Data::copyOf(content));
+}
+
+void MemoryFileSystem::setCreationDate(const std::string& path, std::optional<Date> date) {
+  const std::string resolved = resolve(path);
+  MutexLock lock(_mutex);
+  const auto found = _files.find(resolved);
+  if (found == _files.end()) {
+    ADD_FAILURE() << "setCreationDate: there is no file " << resolved;
+    return;
+  }
+  found->second.created = date;
 }
 
 void MemoryFileSystem::setModificationDate(const std::string& path, Date date) {

@@ -24,10 +24,12 @@ class MemoryFileSystem final : public FileSystem {
   Result<Data> read(const std::string& path, uint64_t maximumSize) const override;
   Result<void> writeAtomically(const std::string& path, const Data& data) override;
   Result<void> write(const std::string& path, const Data& data) override;
+  Result<std::unique_ptr<AppendableFile>> openForAppending(const std::string& path) override;
   Result<void> createDirectory(const std::string& path) override;
   // Removes a file, or a folder that is empty.
   Result<void> remove(const std::string& path) override;
   std::optional<Date> modificationDate(const std::string& path) const override;
+  std::optional<Date> creationDate(const std::string& path) const override;
   Result<std::vector<std::string>> filesBelow(const std::string& path) const override;
   Result<void> setProtectionNone(const std::string& path) override;
 
@@ -35,6 +37,8 @@ class MemoryFileSystem final : public FileSystem {
   void place(const std::string& path, std::string_view content);
   // Dates an existing file, as somebody else's tool may.
   void setModificationDate(const std::string& path, Date date);
+  // Gives an existing file another creation date, or takes it away, as on a file system that keeps none.
+  void setCreationDate(const std::string& path, std::optional<Date> date);
   bool exists(const std::string& path) const;
   // The file's content; empty when there is none.
   std::string content(const std::string& path) const;
@@ -45,9 +49,14 @@ class MemoryFileSystem final : public FileSystem {
   struct File {
     Data content;
     Date modified;
+    std::optional<Date> created;
   };
+  class OpenFile;
   void addFolders(const std::string& resolved) REQUIRES(_mutex);
+  // A file of that name keeps its creation date.
+  void setContent(const std::string& resolved, const Data& data) REQUIRES(_mutex);
   Result<void> store(const std::string& path, const Data& data);
+  Result<void> append(const std::string& resolved, std::string_view text);
 
   const Clock& _clock;
   const std::string _root;

@@ -7,6 +7,7 @@
 
 #include "tests/support/FaultyFileSystem.h"
 #include "tests/support/Matchers.h"
+#include "tests/support/MemorySubmittableLogs.h"
 #include "tests/support/SimulatedClock.h"
 
 namespace telvane::testing {
@@ -81,6 +82,35 @@ TEST_F(MemoryFileSystemTest, datesFilesByItsClock) {
   EXPECT_EQ(_files.modificationDate("/var/absent"), std::nullopt);
 }
 
+TEST_F(MemoryFileSystemTest, addsToFilesThatAreThere) {
+  EXPECT_TRUE(isError(_files.openForAppending("/var/file"), ENOENT));
+  _files.place("/var/file", "one");
+  EXPECT_TRUE(isError(_files.openForAppending("/var"), EISDIR));
+  const auto made = _clock.now();
+  _scheduler.advance(10s);
+  const auto file = _files.openForAppending("/var/file");
+  ASSERT_TRUE(isOk(file));
+  EXPECT_TRUE(isOk((*file)->append(" two")));
+  EXPECT_EQ(_files.content("/var/file"), "one two");
+  EXPECT_EQ(_files.creationDate("/var/file"), made);
+  EXPECT_EQ(_files.modificationDate("/var/file"), _clock.now());
+  EXPECT_TRUE(isOk(_files.remove("/var/file")));
+  EXPECT_TRUE(isError((*file)->append("three"), ENOENT));
+}
+
+TEST_F(MemoryFileSystemTest, aCreationDateStaysUntilTheTestTakesItAway) {
+  _files.place("/var/file", "x");
+  const auto made = _clock.now();
+  _scheduler.advance(10s);
+  EXPECT_TRUE(isOk(_files.write("/var/file", Data())));
+  EXPECT_EQ(_files.creationDate("/var/file"), made);
+  _files.setCreationDate("/var/file", Date());
+  EXPECT_EQ(_files.creationDate("/var/file"), Date());
+  _files.setCreationDate("/var/file", std::nullopt);
+  EXPECT_EQ(_files.creationDate("/var/file"), std::nullopt);
+  EXPECT_TRUE(_files.exists("/var/file"));
+}
+
 TEST_F(MemoryFileSystemTest, listsFilesBelowAFolderInOrder) {
   for (const char* path : {"/var/b", "/var/a/z", "/var/a/b/c", "/variable"}) _files.place(path, "x");
   const auto files = _files.filesBelow("/var");
@@ -139,6 +169,55 @@ TEST_F(FaultyFileSystemTest, fillsTheDisk) {
   EXPECT_TRUE(isError(_faulty.createDirectory("/var/folder"), ENOSPC));
   EXPECT_TRUE(isOk(_faulty.createDirectory("/var")));
   EXPECT_TRUE(isOk(_faulty.remove("/var/file")));
+}
+
+TEST_F(FaultyFileSystemTest, anOpenFileFeelsTheFaults) {
+  const auto file = _faulty.openForAppending("/var/file");
+  ASSERT_TRUE(isOk(file));
+  EXPECT_TRUE(isOk((*file)->append("!")));
+  _faulty.fillDisk();
+  EXPECT_TRUE(isError((*file)->append("?"), ENOSPC));
+  _faulty.failWrites(EACCES, "file");
+  EXPECT_TRUE(isError((*file)->append("?"), EACCES));
+  EXPECT_TRUE(isError(_faulty.openForAppending("/var/file"), EACCES));
+  _faulty.failReads(EIO);
+  EXPECT_EQ(_faulty.creationDate("/var/file"), std::nullopt);
+  _faulty.heal();
+  EXPECT_TRUE(isOk((*file)->append("?")));
+  EXPECT_EQ(_files.content("/var/file"), "old content!?");
+  EXPECT_TRUE(_faulty.creationDate("/var/file").has_value());
+}
+
+class MemorySubmittableLogsTest : public FaultyFileSystemTest {
+ protected:
+  static constexpr char kLog[] = "/var/logs/one.ips";
+  static constexpr char kSubmitted[] = "/var/mobile/Library/Logs/CrashReporter/Submission/one.ips";
+  MemorySubmittableLogs _logs{_faulty};
+};
+
+TEST_F(MemorySubmittableLogsTest, makesAndSubmitsLogsAndTellsWhatItWasAskedFor) {
+  EXPECT_TRUE(isOk(_logs.createTemporaryLog("224", kLog)));
+  EXPECT_TRUE(_files.exists(kLog));
+  EXPECT_TRUE(isError(_logs.createTemporaryLog("224", kLog), EEXIST));
+  EXPECT_TRUE(isOk(_logs.moveToSubmissionArea("225", kLog)));
+  EXPECT_FALSE(_files.exists(kLog));
+  EXPECT_TRUE(_files.exists(kSubmitted));
+  EXPECT_THAT(_logs.calls(), ElementsAre("create 224 /var/logs/one.ips", "create 224 /var/logs/one.ips",
+                                         "submit 225 /var/logs/one.ips"));
+}
+
+TEST_F(MemorySubmittableLogsTest, leavesTheLogWhenItCannotBeSubmitted) {
+  EXPECT_TRUE(isError(_logs.moveToSubmissionArea("224", kLog), ENOENT));
+  _files.place(kLog, "text");
+  _logs.setRefusing(true);
+  EXPECT_TRUE(isError(_logs.moveToSubmissionArea("224", kLog), EPERM));
+  _logs.setRefusing(false);
+  _files.place(kSubmitted, "earlier");
+  EXPECT_TRUE(isError(_logs.moveToSubmissionArea("224", kLog), EEXIST));
+  _faulty.failWrites(EROFS);
+  EXPECT_TRUE(isError(_logs.createTemporaryLog("224", "/var/logs/two.ips"), EROFS));
+  EXPECT_EQ(_files.content(kLog), "text");
+  EXPECT_EQ(_files.content(kSubmitted), "earlier");
 }
 
 }  // namespace

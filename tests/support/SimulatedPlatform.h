@@ -13,7 +13,9 @@
 #include "tests/support/FixedConsent.h"
 #include "tests/support/FixedDeviceAnswers.h"
 #include "tests/support/FixedLocale.h"
+#include "tests/support/FixedProcessMemory.h"
 #include "tests/support/MemoryFileSystem.h"
+#include "tests/support/MemorySubmittableLogs.h"
 #include "tests/support/MemoryUserDefaults.h"
 #include "tests/support/RecordingLog.h"
 #include "tests/support/ScriptedNetwork.h"
@@ -70,6 +72,8 @@ class SimulatedPlatform {
   FaultyFileSystem& fileFaults() noexcept { return _faultyFiles; }
   MemoryUserDefaults& userDefaults() noexcept { return _storage->userDefaults; }
   std::shared_ptr<SimulatedStorage> storage() const noexcept { return _storage; }
+  MemorySubmittableLogs& submittableLogs() noexcept { return _submittableLogs; }
+  FixedProcessMemory& processMemory() noexcept { return _processMemory; }
   FixedDeviceAnswers& deviceAnswers() noexcept { return _deviceAnswers; }
   FixedLocale& locale() noexcept { return _locale; }
   FixedConsent& consent() noexcept { return _consent; }
@@ -95,6 +99,8 @@ class SimulatedPlatform {
   RecordingLog _log;
   SeededRandom _random;
   FaultyFileSystem _faultyFiles;
+  MemorySubmittableLogs _submittableLogs;
+  FixedProcessMemory _processMemory;
   FixedDeviceAnswers _deviceAnswers;
   FixedLocale _locale;
   FixedConsent _consent;

@@ -110,6 +110,28 @@ TEST_F(PosixFileSystemTest, tellsTheModificationDate) {
   EXPECT_FALSE(_files.modificationDate(_folder.at("none")).has_value());
 }
 
+TEST_F(PosixFileSystemTest, aFileIsDatedByItsMakingHoweverOftenItGrows) {
+  const auto before = std::chrono::system_clock::now() - std::chrono::seconds(2);  // the kernel's clock is coarse
+  _folder.write("file", "one");
+  const std::optional<Date> made = _files.creationDate(_folder.at("file"));
+  ASSERT_TRUE(made.has_value());
+  EXPECT_GE(made->time(), before);
+  EXPECT_LE(made->time(), std::chrono::system_clock::now());
+  const Result<std::unique_ptr<AppendableFile>> file = _files.openForAppending(_folder.at("file"));
+  ASSERT_TRUE(succeeds(file));
+  ASSERT_TRUE(succeeds((*file)->append(" and two")));
+  EXPECT_EQ(_folder.read("file"), "one and two");
+  EXPECT_EQ(_files.creationDate(_folder.at("file")), made);
+  EXPECT_FALSE(_files.creationDate(_folder.at("none")).has_value());
+}
+
+TEST_F(PosixFileSystemTest, aLinkIsDatedByItselfAndLeadsToNoAppending) {
+  std::filesystem::create_symlink(_folder.at("none"), _folder.at("link"));
+  EXPECT_TRUE(_files.creationDate(_folder.at("link")).has_value());
+  EXPECT_TRUE(failsWith(_files.openForAppending(_folder.at("link")), ELOOP));
+  EXPECT_TRUE(failsWith(_files.openForAppending(_folder.at("none")), ENOENT));
+}
+
 TEST_F(PosixFileSystemTest, listsRegularFilesAtAnyDepthInOrder) {
   _folder.write("top/b", "1");
   _folder.write("top/a/z", "2");

@@ -1,4 +1,4 @@
-#include "platform/ProcessMemory.h"
+#include "platform/system/SystemProcessMemory.h"
 
 #include <unistd.h>
 
@@ -23,7 +23,7 @@ uint64_t takeNumber(std::string_view& text) {
 
 }  // namespace
 
-uint64_t taskMemory() {
+uint64_t SystemProcessMemory::taskMemory() const {
   const Result<fileaccess::Content> status = fileaccess::read("/proc/self/statm", kLongestLine);
   if (!status) return 0;
   std::string_view text = status->data.view();
@@ -32,7 +32,5 @@ uint64_t taskMemory() {
   const uint64_t shared = takeNumber(text);
   return resident < shared ? 0 : (resident - shared) * static_cast<uint64_t>(::sysconf(_SC_PAGESIZE));
 }
-
-int64_t currentProcessID() { return ::getpid(); }
 
 }  // namespace telvane
