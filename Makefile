@@ -16,7 +16,7 @@ lint: ## check the house's arrows and run clang-tidy
 	@sh scripts/lint
 sanitize: ## unit tests under the address, undefined and thread sanitizers
 	@sh scripts/sanitize
-bench: ## measure: micro-benchmarks, the whole road, the ceiling
+bench: ## measure: single stations, then the whole road beside the ceiling
 	@sh scripts/bench
 fuzz: ## a minute of fuzzing for each decoder of outside input
 	@sh scripts/fuzz

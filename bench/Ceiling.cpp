@@ -1,14 +1,21 @@
 // The least that any agent has to do for an event, in one thread: write it as JSON, compress it in batches of 50, post
 // the batches over one kept TLS connection. What the daemon costs more than this is what the daemon costs.
+//
+//   telvane-ceiling --url URL --ca FILE [--events N]
 #include <curl/curl.h>
+#include <unistd.h>
 #include <zlib.h>
 
+#include <algorithm>
 #include <cstdio>
 #include <cstdlib>
+#include <stdexcept>
 #include <string>
 #include <vector>
 
 #include "bench/BenchEvent.h"
+#include "bench/InstructionCounter.h"
+#include "bench/KeptConnection.h"
 #include "bench/Measurement.h"
 #include "platform/JSON.h"
 
@@ -17,6 +24,7 @@ namespace {
 using namespace telvane;
 
 constexpr uint64_t kBatch = 50;
+constexpr uint64_t kMadeAtOnce = 5000;
 
 // The event as the collector receives it: the client's fields with what the daemon sets beside them.
 Dictionary annotate(Dictionary event, uint64_t i) {
@@ -57,73 +65,76 @@ std::string gzip(const std::string& text) {
   return out;
 }
 
-size_t swallow(char*, size_t size, size_t count, void*) { return size * count; }
+// The body of one post.
+void writeBatch(const std::vector<Value>& events, size_t first, std::string& text) {
+  text = R"({"postTime":1795000000.123456,"clientId":"0E0C2D29-61B5-4E58-9C4B-6B41E3B1D7C5","events":[)";
+  for (size_t n = first; n < std::min<size_t>(first + kBatch, events.size()); ++n) {
+    if (n > first) text += ',';
+    if (json::append(events[n], json::Style::Compact, text).has_error()) throw std::runtime_error("no JSON");
+  }
+  text += "]}";
+}
 
-class Poster {
- public:
-  Poster(const std::string& url, const std::string& ca) : _curl(curl_easy_init()) {
-    _headers = curl_slist_append(_headers, "Content-Type: application/json");
-    _headers = curl_slist_append(_headers, "Content-Encoding: gzip");
-    _headers = curl_slist_append(_headers, "Expect:");
-    curl_easy_setopt(_curl, CURLOPT_URL, url.c_str());
-    curl_easy_setopt(_curl, CURLOPT_CAINFO, ca.c_str());
-    curl_easy_setopt(_curl, CURLOPT_HTTPHEADER, _headers);
-    curl_easy_setopt(_curl, CURLOPT_WRITEFUNCTION, swallow);
-    curl_easy_setopt(_curl, CURLOPT_NOSIGNAL, 1L);
-  }
-  ~Poster() {
-    curl_slist_free_all(_headers);
-    curl_easy_cleanup(_curl);
-  }
-  bool post(const std::string& body) {
-    curl_easy_setopt(_curl, CURLOPT_POSTFIELDSIZE, static_cast<long>(body.size()));
-    curl_easy_setopt(_curl, CURLOPT_POSTFIELDS, body.data());
-    long status = 0;
-    return curl_easy_perform(_curl) == CURLE_OK &&
-           curl_easy_getinfo(_curl, CURLINFO_RESPONSE_CODE, &status) == CURLE_OK && status == 200;
-  }
+// What has been spent so far by a process of one thread.
+struct Spent {
+  double microseconds = 0;
+  double instructions = 0;
 
- private:
-  CURL* _curl;
-  curl_slist* _headers = nullptr;
+  static Spent now(const bench::InstructionCounter& counter) {
+    return {bench::ownCPUMicroseconds(), static_cast<double>(counter.count().value_or(0))};
+  }
+  void addSince(const Spent& before, const Spent& after) {
+    microseconds += after.microseconds - before.microseconds;
+    instructions += after.instructions - before.instructions;
+  }
 };
+
+struct Totals {
+  Spent spent;
+  uint64_t bytes = 0;
+};
+
+// Makes the events (they come from outside in real life, so that is not counted), and sends them.
+Totals send(uint64_t events, bench::KeptConnection& connection) {
+  const bench::InstructionCounter counter(getpid());
+  Totals totals;
+  std::vector<Value> made;
+  std::string text;
+  for (uint64_t sent = 0; sent < events;) {
+    made.clear();
+    const uint64_t end = std::min(sent + kMadeAtOnce, events);
+    for (; sent < end; ++sent) made.push_back(annotate(bench::makePayload(sent), sent));
+    const Spent before = Spent::now(counter);
+    for (size_t first = 0; first < made.size(); first += kBatch) {
+      writeBatch(made, first, text);
+      const std::string body = gzip(text);
+      totals.bytes += body.size();
+      if (!connection.post(body)) throw std::runtime_error("the collector did not take a batch");
+    }
+    totals.spent.addSince(before, Spent::now(counter));
+  }
+  return totals;
+}
+
+void run(int argc, char** argv) {
+  bench::KeptConnection connection(bench::option(argc, argv, "url", ""), bench::option(argc, argv, "ca", ""),
+                                   {"Content-Type: application/json", "Content-Encoding: gzip", "Expect:"});
+  const double start = bench::monotonicSeconds();
+  const Totals totals = send(bench::numberOption(argc, argv, "events", 200000), connection);
+  std::printf("{\"seconds\": %.6f, \"cpuMicroseconds\": %.1f, \"instructions\": %.0f, \"bytes\": %llu}\n",
+              bench::monotonicSeconds() - start, totals.spent.microseconds, totals.spent.instructions,
+              static_cast<unsigned long long>(totals.bytes));
+}
 
 }  // namespace
 
 int main(int argc, char** argv) {
-  const uint64_t events = std::strtoull(bench::option(argc, argv, "events", "200000").c_str(), nullptr, 10);
   curl_global_init(CURL_GLOBAL_DEFAULT);
-  Poster poster(bench::option(argc, argv, "url", ""), bench::option(argc, argv, "ca", ""));
-  uint64_t bytes = 0;
-  double making = 0;
-  const double startCPU = bench::ownCPUMicroseconds();
-  const double start = bench::monotonicSeconds();
-  std::vector<Value> made;
-  std::string json;
-  constexpr uint64_t kMadeAtOnce = 5000;
-  for (uint64_t i = 0; i < events;) {
-    // The events themselves come from outside in real life.
-    const double before = bench::threadCPUMicroseconds();
-    made.clear();
-    for (uint64_t n = 0; n < kMadeAtOnce && i < events; ++n, ++i) made.push_back(annotate(bench::makePayload(i), i));
-    making += bench::threadCPUMicroseconds() - before;
-    for (size_t first = 0; first < made.size(); first += kBatch) {
-      json = R"({"postTime":1795000000.123456,"clientId":"0E0C2D29-61B5-4E58-9C4B-6B41E3B1D7C5","events":[)";
-      for (size_t n = first; n < std::min(first + kBatch, made.size()); ++n) {
-        if (n > first) json += ',';
-        if (!json::append(made[n], json::Style::Compact, json).has_value()) return EXIT_FAILURE;
-      }
-      json += "]}";
-      const std::string body = gzip(json);
-      bytes += body.size();
-      if (!poster.post(body)) {
-        std::fprintf(stderr, "ceiling: the collector did not take a batch\n");
-        return EXIT_FAILURE;
-      }
-    }
+  try {
+    run(argc, argv);
+    return EXIT_SUCCESS;
+  } catch (const std::exception& error) {
+    std::fprintf(stderr, "telvane-ceiling: %s\n", error.what());
+    return EXIT_FAILURE;
   }
-  const double cpu = bench::ownCPUMicroseconds() - startCPU - making;
-  std::printf("{\"seconds\": %.6f, \"cpuMicroseconds\": %.1f, \"bytes\": %llu}\n", bench::monotonicSeconds() - start,
-              cpu, static_cast<unsigned long long>(bytes));
-  return EXIT_SUCCESS;
 }

@@ -2,12 +2,11 @@
 
 #include <sys/resource.h>
 #include <time.h>
-#include <unistd.h>
 
+#include <charconv>
 #include <chrono>
 #include <filesystem>
 #include <fstream>
-#include <sstream>
 
 namespace telvane::bench {
 namespace {
@@ -15,6 +14,14 @@ namespace {
 double microseconds(const timeval& time) {
   return static_cast<double>(time.tv_sec) * 1e6 + static_cast<double>(time.tv_usec);
 }
+
+double microsecondsOn(clockid_t clock) {
+  timespec time{};
+  if (clock_gettime(clock, &time) != 0) return 0;
+  return static_cast<double>(time.tv_sec) * 1e6 + static_cast<double>(time.tv_nsec) / 1e3;
+}
+
+std::string processFolder(pid_t pid) { return "/proc/" + std::to_string(pid); }
 
 uint64_t statusNumber(const std::string& path, const std::string& key) {
   std::ifstream file(path);
@@ -33,45 +40,37 @@ double ownCPUMicroseconds() {
   return microseconds(usage.ru_utime) + microseconds(usage.ru_stime);
 }
 
-double threadCPUMicroseconds() {
-  timespec time{};
-  clock_gettime(CLOCK_THREAD_CPUTIME_ID, &time);
-  return static_cast<double>(time.tv_sec) * 1e6 + static_cast<double>(time.tv_nsec) / 1e3;
-}
+double threadCPUMicroseconds() { return microsecondsOn(CLOCK_THREAD_CPUTIME_ID); }
 
 double cpuMicrosecondsOf(pid_t pid) {
-  // schedstat counts in nanoseconds, per thread; stat in ticks of 10 ms.
-  double nanoseconds = 0;
-  std::error_code error;
-  for (const auto& thread : std::filesystem::directory_iterator("/proc/" + std::to_string(pid) + "/task", error)) {
-    std::ifstream file(thread.path() / "schedstat");
-    double running = 0;
-    if (file >> running) nanoseconds += running;
-  }
-  std::ifstream stat("/proc/" + std::to_string(pid) + "/stat");
-  std::string text((std::istreambuf_iterator<char>(stat)), {});
-  const size_t name = text.rfind(')');
-  if (name == std::string::npos) return 0;
-  std::istringstream fields(text.substr(name + 2));
-  std::string skipped;
-  for (int i = 0; i < 11; ++i) fields >> skipped;
-  double user = 0;
-  double system = 0;
-  fields >> user >> system;
-  const double ticks = (user + system) * 1e6 / static_cast<double>(sysconf(_SC_CLK_TCK));
-  // Threads that have ended are in the ticks only.
-  return std::max(ticks, nanoseconds / 1e3);
+  clockid_t clock{};
+  return clock_getcpuclockid(pid, &clock) == 0 ? microsecondsOn(clock) : 0;
 }
 
-uint64_t peakMemoryOf(pid_t pid) { return statusNumber("/proc/" + std::to_string(pid) + "/status", "VmHWM:") * 1024; }
+uint64_t residentMemoryOf(pid_t pid) { return statusNumber(processFolder(pid) + "/status", "VmRSS:") * 1024; }
 
-uint64_t wakeUpsOf(pid_t pid) {
-  uint64_t switches = 0;
+uint64_t peakMemoryOf(pid_t pid) { return statusNumber(processFolder(pid) + "/status", "VmHWM:") * 1024; }
+
+std::map<pid_t, uint64_t> switchesOf(pid_t pid) {
+  std::map<pid_t, uint64_t> switches;
   std::error_code error;
-  for (const auto& thread : std::filesystem::directory_iterator("/proc/" + std::to_string(pid) + "/task", error)) {
-    switches += statusNumber((thread.path() / "status").string(), "voluntary_ctxt_switches:");
+  for (const auto& thread : std::filesystem::directory_iterator(processFolder(pid) + "/task", error)) {
+    switches[std::stoi(thread.path().filename().string())] =
+        statusNumber((thread.path() / "status").string(), "voluntary_ctxt_switches:");
   }
   return switches;
+}
+
+uint64_t wakeUpsBetween(const std::map<pid_t, uint64_t>& before, const std::map<pid_t, uint64_t>& after) {
+  uint64_t count = 0;
+  for (const auto& [thread, switches] : after) {
+    const auto earlier = before.find(thread);
+    count += switches - (earlier != before.end() ? earlier->second : 0);
+  }
+  for (const auto& [thread, switches] : before) {
+    if (after.count(thread) == 0) ++count;
+  }
+  return count;
 }
 
 double monotonicSeconds() {
@@ -83,6 +82,20 @@ std::string option(int argc, char** argv, const std::string& name, const std::st
     if (argv[i] == "--" + name) return argv[i + 1];
   }
   return fallback;
+}
+
+uint64_t numberOption(int argc, char** argv, const std::string& name, uint64_t fallback) {
+  const std::string text = option(argc, argv, name, "");
+  uint64_t number = fallback;
+  std::from_chars(text.data(), text.data() + text.size(), number);
+  return number;
+}
+
+bool hasOption(int argc, char** argv, const std::string& name) {
+  for (int i = 1; i < argc; ++i) {
+    if (argv[i] == "--" + name) return true;
+  }
+  return false;
 }
 
 }  // namespace telvane::bench

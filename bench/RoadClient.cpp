@@ -1,66 +1,111 @@
-// Sends events as fast as it can through the client library and prints what that cost this process.
+// Sends batched events as fast as it can through the client library and prints what that cost this process.
 //
-// The library drops what it cannot hand on, so this client waits for a flush now and then: it is never more than two
+//   telvane-road-client [--events N] [--client-type N] [--sessions N] [--held]
+//
+// --sessions: that many, each with its own connection; the events go to them in turn. --held: says "ready" when they
+// are configured, and sends when its input ends.
+//
+// The library drops what it cannot hand on, so this client waits for flushes now and then: it is never more than two
 // windows ahead of the daemon.
 #include <telvane/Telvane.h>
 
+#include <algorithm>
 #include <cstdio>
 #include <cstdlib>
 #include <future>
+#include <stdexcept>
 #include <string>
+#include <vector>
 
 #include "bench/BenchEvent.h"
 #include "bench/Measurement.h"
+#include "bench/RoadBag.h"
 
 namespace {
 
-constexpr uint64_t kWindow = 5000;
-constexpr uint16_t kCategory = 11;
+using namespace telvane;
 
-std::future<bool> flush(telvane::Telvane& session) {
-  auto answered = std::make_shared<std::promise<bool>>();
-  std::future<bool> future = answered->get_future();
-  session.flushMessagesWithCompletion(
-      [answered](const std::optional<telvane::Error>& error) { answered->set_value(!error.has_value()); });
-  return future;
+constexpr uint64_t kWindow = 5000;
+
+// A session and its last flush.
+struct Sender {
+  std::shared_ptr<Telvane> session;
+  std::future<void> flushed;
+};
+
+std::shared_ptr<Telvane> openSession(int clientType, uint64_t number) {
+  const Dictionary sessionInfo{{"ComponentType", clientType},
+                               {"ClientVersion", 1},
+                               {"SessionID", number},
+                               {"BatchEvents", true},
+                               {"RequireUserDict", true}};
+  const Dictionary userInfo{{"_clientName", "bench"}, {"_serviceName", "road"}};
+  auto session = Telvane::initWithSessionInfo(sessionInfo, userInfo);
+  if (session == nullptr) throw std::runtime_error("there is no session");
+  auto configured = std::make_shared<std::promise<bool>>();
+  std::future<bool> isEnabled = configured->get_future();
+  session->startConfigurationWithCompletionHandler([configured = std::move(configured)](const Value& names) {
+    configured->set_value(names.array() != nullptr && names.array()->size() > 0);
+  });
+  if (!isEnabled.get()) throw std::runtime_error("no backend is enabled");
+  return session;
+}
+
+void flush(Sender& sender) {
+  if (sender.flushed.valid()) sender.flushed.wait();
+  auto answered = std::make_shared<std::promise<void>>();
+  sender.flushed = answered->get_future();
+  sender.session->flushMessagesWithCompletion(
+      [answered = std::move(answered)](const std::optional<Error>&) { answered->set_value(); });
+}
+
+// Returns the CPU time that making the payloads took; it belongs to the application, not to the library.
+double send(std::vector<Sender>& senders, uint64_t events) {
+  double making = 0;
+  std::vector<Dictionary> payloads;
+  for (uint64_t sent = 0; sent < events;) {
+    const double before = bench::threadCPUMicroseconds();
+    payloads.clear();
+    const uint64_t end = std::min(sent + kWindow, events);
+    for (uint64_t i = sent; i < end; ++i) payloads.push_back(bench::makePayload(i));
+    making += bench::threadCPUMicroseconds() - before;
+    for (const Dictionary& payload : payloads) {
+      senders[sent++ % senders.size()].session->sendMessageWithCategory(bench::kEventCategory, 1, payload);
+    }
+    for (Sender& sender : senders) flush(sender);
+  }
+  for (Sender& sender : senders) sender.flushed.wait();
+  return making;
+}
+
+void waitForEndOfInput() {
+  std::puts("ready");
+  std::fflush(stdout);
+  while (std::getchar() != EOF) {
+  }
+}
+
+void run(int argc, char** argv) {
+  const uint64_t events = bench::numberOption(argc, argv, "events", 200000);
+  const int clientType = static_cast<int>(bench::numberOption(argc, argv, "client-type", 7));
+  std::vector<Sender> senders(std::max<uint64_t>(bench::numberOption(argc, argv, "sessions", 1), 1));
+  for (uint64_t i = 0; i < senders.size(); ++i) senders[i].session = openSession(clientType, i + 1);
+  if (bench::hasOption(argc, argv, "held")) waitForEndOfInput();
+  const double startCPU = bench::ownCPUMicroseconds();
+  const double start = bench::monotonicSeconds();
+  const double making = send(senders, events);
+  std::printf("{\"seconds\": %.6f, \"cpuMicroseconds\": %.1f}\n", bench::monotonicSeconds() - start,
+              bench::ownCPUMicroseconds() - startCPU - making);
 }
 
 }  // namespace
 
 int main(int argc, char** argv) {
-  using namespace telvane;
-  const uint64_t events = std::strtoull(bench::option(argc, argv, "events", "200000").c_str(), nullptr, 10);
-  const Dictionary sessionInfo{
-      {"ComponentType", 7}, {"ClientVersion", 1}, {"SessionID", 1}, {"BatchEvents", true}, {"RequireUserDict", true}};
-  const Dictionary userInfo{{"_clientName", "bench"}, {"_serviceName", "road"}};
-  const auto session = Telvane::initWithSessionInfo(sessionInfo, userInfo);
-  if (session == nullptr) return EXIT_FAILURE;
-  std::promise<std::string> configured;
-  session->startConfigurationWithCompletionHandler([&configured](const Value& names) {
-    configured.set_value(names.array() != nullptr && names.array()->size() > 0 ? "ready" : "");
-  });
-  if (configured.get_future().get().empty()) {
-    std::fprintf(stderr, "road-client: no backend is enabled\n");
+  try {
+    run(argc, argv);
+    return EXIT_SUCCESS;
+  } catch (const std::exception& error) {
+    std::fprintf(stderr, "telvane-road-client: %s\n", error.what());
     return EXIT_FAILURE;
   }
-  const double startCPU = bench::ownCPUMicroseconds();
-  const double start = bench::monotonicSeconds();
-  // What making the payloads costs belongs to the application, not to the library.
-  double making = 0;
-  std::future<bool> window;
-  std::vector<Dictionary> payloads;
-  for (uint64_t i = 0; i < events;) {
-    const double before = bench::threadCPUMicroseconds();
-    payloads.clear();
-    for (uint64_t n = 0; n < kWindow && i < events; ++n, ++i) payloads.push_back(bench::makePayload(i));
-    making += bench::threadCPUMicroseconds() - before;
-    for (const Dictionary& payload : payloads) session->sendMessageWithCategory(kCategory, 1, payload);
-    if (window.valid()) window.wait();
-    window = flush(*session);
-  }
-  if (window.valid()) window.wait();
-  const double seconds = bench::monotonicSeconds() - start;
-  const double cpu = bench::ownCPUMicroseconds() - startCPU - making;
-  std::printf("{\"seconds\": %.6f, \"cpuMicroseconds\": %.1f}\n", seconds, cpu);
-  return EXIT_SUCCESS;
 }

@@ -1,183 +1,148 @@
 #include "bench/RoadInstance.h"
 
-#include <curl/curl.h>
-#include <fcntl.h>
 #include <signal.h>
-#include <sys/wait.h>
+#include <sys/socket.h>
+#include <sys/un.h>
 #include <unistd.h>
 
 #include <chrono>
-#include <filesystem>
 #include <functional>
 #include <stdexcept>
 #include <thread>
 
-#include "foundation/Base64.h"
-#include "interfaces/StorebagKeys.h"
-#include "platform/Crypto.h"
+#include "bench/Measurement.h"
+#include "interfaces/ClientTypes.h"
 #include "platform/JSON.h"
-#include "platform/PropertyList.h"
 
 namespace telvane::bench {
 namespace {
 
-constexpr auto kPatience = std::chrono::seconds(20);
+constexpr auto kEndPatience = std::chrono::seconds(40);
+constexpr auto kRunPatience = std::chrono::minutes(10);
+constexpr double kStandstillSeconds = 10;
 
 void waitUntil(const std::string& what, const std::function<bool()>& condition) {
-  const auto deadline = std::chrono::steady_clock::now() + kPatience;
-  while (!condition()) {
-    if (std::chrono::steady_clock::now() > deadline) throw std::runtime_error("gave up waiting for " + what);
-    std::this_thread::sleep_for(std::chrono::milliseconds(5));
-  }
+  if (!testing::eventually(condition)) throw std::runtime_error("gave up waiting for " + what);
 }
 
-std::vector<char*> pointers(const std::vector<std::string>& texts) {
-  std::vector<char*> result;
-  for (const std::string& text : texts) result.push_back(const_cast<char*>(text.c_str()));
-  result.push_back(nullptr);
-  return result;
+// Whether somebody takes connections on the socket. At its quietest a daemon says nothing of having started.
+bool isAccepting(const std::string& socketPath) {
+  sockaddr_un address{};
+  address.sun_family = AF_UNIX;
+  if (socketPath.size() >= sizeof(address.sun_path)) throw std::runtime_error("too long for a socket: " + socketPath);
+  socketPath.copy(address.sun_path, socketPath.size());
+  const int descriptor = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  const bool isOpen = connect(descriptor, reinterpret_cast<const sockaddr*>(&address), sizeof(address)) == 0;
+  close(descriptor);
+  return isOpen;
 }
 
-size_t collect(char* bytes, size_t size, size_t count, void* text) {
-  static_cast<std::string*>(text)->append(bytes, size * count);
-  return size * count;
+Dictionary parseFigures(std::string_view text) {
+  const auto parsed = json::parse(text);
+  if (parsed.has_error() || !parsed->isDictionary()) throw std::runtime_error("no figures in: " + std::string(text));
+  return *parsed->dictionary();
 }
 
-std::string plist(const Value& value) {
-  return std::string(propertylist::serialize(value, propertylist::Format::XML).value().view());
-}
-
-// One HTTPS backend that takes everything. Consent is overridden, as in a bag for a fleet that has agreed by contract;
-// with it no event text is kept on the device.
-Dictionary makeBag(const std::string& postURL) {
-  const Dictionary client{{kClientEntryPostURL, postURL},
-                          {kClientEntryOverrideDNU, 1},
-                          {kClientEntryLocaleWhitelist, Array{Value("US")}},
-                          {kClientEntryFilters, Array{}},
-                          {kClientEntrySamplingThreshold, 1.0}};
-  Dictionary section;
-  section.set("splunk", Dictionary{{kProfileClients, Array{Value(client)}}});
-  return {{kEnvironmentRelease, section}, {kStorebagVersion, "bench-1"}, {kStorebagRefreshCycle, 3600}};
+std::string_view lastLine(std::string_view text) {
+  while (text.ends_with('\n')) text.remove_suffix(1);
+  return text.substr(text.rfind('\n') + 1);
 }
 
 }  // namespace
 
-Child::Child(const std::vector<std::string>& arguments, const std::vector<std::string>& environment,
-             const std::string& outputFile)
-    : _pid(fork()) {
-  if (_pid != 0) return;
-  const int output = open(outputFile.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_APPEND, 0600);
-  dup2(output, STDOUT_FILENO);
-  execve(arguments[0].c_str(), pointers(arguments).data(), pointers(environment).data());
-  _exit(127);
+RoadInstance::RoadInstance() {
+  _instance.startCollector({"--discard"});
+  _collector.emplace(collectorURL("/statistics"), authorityFile(), std::vector<std::string>{});
+  for (const char* program : {"telvane-road-client", "telvane-road-realtime"}) _instance.grant(program);
 }
 
-Child::~Child() {
-  if (_pid <= 0) return;
-  terminate();
-  wait();
+void RoadInstance::givenBag(int type, BagRules rules, const std::optional<std::string>& postURL) {
+  const std::string name(clientType(type)->storebagName);
+  _instance.givenStorebag(name, roadBag(rules, postURL.value_or(collectorURL("/events"))));
 }
 
-int Child::wait() {
-  int status = 0;
-  waitpid(std::exchange(_pid, -1), &status, 0);
-  return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-}
-
-void Child::terminate() { kill(_pid, SIGTERM); }
-
-RoadInstance::RoadInstance(std::string programs, const std::string& daemonLogLevel)
-    : _programs(std::move(programs)), _certificates(_scratch.path()) {
-  startCollector();
-  writeConfiguration();
-  startDaemon(daemonLogLevel);
-}
-
-RoadInstance::~RoadInstance() = default;
-
-std::vector<std::string> RoadInstance::environment() const {
-  return {"TELVANE_ROOT=" + _scratch.at("root"),
-          "TELVANE_BUNDLE=" + _scratch.at("bundle"),
-          "TELVANE_CA_FILE=" + _certificates.authorityFile(),
-          "HOME=" + _scratch.at("home"),
-          "LANG=en_US.UTF-8",
-          "PATH=/usr/bin:/bin"};
-}
-
-void RoadInstance::startCollector() {
-  const auto server = _certificates.valid();
-  std::filesystem::create_directories(_scratch.at("storebags"));
-  _collector = std::make_unique<Child>(
-      std::vector<std::string>{_programs + "/telvane-collector", "--listen", "127.0.0.1:0", "--certificate",
-                               server.certificateFile, "--private-key", server.privateKeyFile, "--storebags",
-                               _scratch.at("storebags"), "--discard"},
-      environment(), _scratch.at("collector.out"));
-  waitUntil("the collector's address", [this] {
-    const std::string text = _scratch.read("collector.out");
-    const size_t end = text.find('\n');
-    if (end == std::string::npos) return false;
-    const size_t start = text.substr(0, end).find_last_of(' ');
-    _collectorAddress =
-        text.substr(start == std::string::npos ? 0 : start + 1, end - (start == std::string::npos ? 0 : start + 1));
-    return true;
+void RoadInstance::startDaemon(std::string_view logLevel) {
+  // At its usual level a log of many runs would fill a disk.
+  _instance.givenFile("daemon.err", "");
+  _instance.launchDaemon({"--log-level", std::string(logLevel)});
+  waitUntil("the daemon", [this] {
+    if (!_instance.daemon().isRunning()) throw std::runtime_error("the daemon ended: " + _instance.daemonLog());
+    return isAccepting(_instance.socketPath());
   });
 }
 
-void RoadInstance::writeConfiguration() {
-  const auto key = crypto::PrivateKey::generate().value();
-  const Data bag =
-      propertylist::serialize(Value(makeBag(collectorURL("/events"))), propertylist::Format::Binary).value();
-  const Data signature = key.signSHA1({bag.bytes(), bag.size()}).value();
-  const Dictionary envelope{{kEnvelopeBag, base64Encode({bag.bytes(), bag.size()})},
-                            {kEnvelopeSignature, base64Encode({signature.bytes(), signature.size()})}};
-  _scratch.write("storebags/conferencing", plist(Value(envelope)));
-  _scratch.write("bundle/publicKey.der", std::string(key.publicKeyDER().view()));
-  Dictionary info;
-  info.set("CFBundleVersion", Value("1.0.0"));
-  _scratch.write("bundle/Info.plist", plist(Value(info)));
-  Dictionary granted;
-  granted.set("com.corvex.private.telvaned", Value(true));
-  Dictionary grant;
-  grant.set("executables", Array{Value(std::filesystem::canonical(_programs + "/telvane-road-client").string())});
-  grant.set("entitlements", granted);
-  _scratch.write("root/etc/telvane/entitlements.d/bench.plist", plist(Value(grant)));
-  Dictionary defaults;
-  defaults.set("telvane_storebag_url", Value(collectorURL("/storebags")));
-  _scratch.write("home/Library/Preferences/com.corvex.telvane.plist", plist(Value(defaults)));
+void RoadInstance::endDaemon() {
+  _instance.daemon().signal(SIGTERM);
+  const int status = _instance.daemon().wait(kEndPatience);
+  if (status != 0) throw std::runtime_error("the daemon ended with " + std::to_string(status));
+  // What it still had has been posted by now; nothing may have come twice.
+  waitForEvents(0);
 }
 
-void RoadInstance::startDaemon(const std::string& logLevel) {
-  _daemon = std::make_unique<Child>(
-      std::vector<std::string>{_programs + "/telvaned", "--log-level", logLevel, "--log-target", "stderr"},
-      environment(), _scratch.at("daemon.out"));
-  waitUntil("the daemon's socket",
-            [this] { return std::filesystem::exists(_scratch.at("root/run/telvane/com.corvex.telvaned.socket")); });
+RoadInstance::Running RoadInstance::start(const std::string& program, const std::vector<std::string>& arguments,
+                                          const std::optional<std::string>& outputName) {
+  const std::string name = outputName.value_or(program);
+  // What an earlier run printed under the name is gone.
+  _instance.givenFile(name + ".out", "");
+  _instance.givenFile(name + ".err", "");
+  return {_instance.startProgram(program, arguments, name), name};
 }
 
-uint64_t RoadInstance::collected(const std::string& name) const {
-  std::string text;
-  CURL* curl = curl_easy_init();
-  curl_easy_setopt(curl, CURLOPT_URL, collectorURL("/statistics").c_str());
-  curl_easy_setopt(curl, CURLOPT_CAINFO, authorityFile().c_str());
-  curl_easy_setopt(curl, CURLOPT_WRITEFUNCTION, collect);
-  curl_easy_setopt(curl, CURLOPT_WRITEDATA, &text);
-  const CURLcode code = curl_easy_perform(curl);
-  curl_easy_cleanup(curl);
-  if (code != CURLE_OK)
-    throw std::runtime_error("the collector does not answer: " + std::string(curl_easy_strerror(code)));
-  const auto parsed = json::parse(text);
-  if (parsed.has_error() || !parsed->isDictionary()) throw std::runtime_error("the collector answers: " + text);
-  return (*parsed->dictionary())[name].unsignedValue();
+void RoadInstance::waitForLine(const Running& running, const std::string& line) {
+  waitUntil("\"" + line + "\" of " + running.outputName, [&] {
+    const std::string output = "\n" + _instance.read(running.outputName + ".out");
+    if (output.find("\n" + line + "\n") != std::string::npos) return true;
+    if (!running.process->isRunning()) throw std::runtime_error(_instance.read(running.outputName + ".err"));
+    return false;
+  });
 }
 
-std::string RoadInstance::run(const std::string& program, const std::vector<std::string>& arguments) const {
-  std::vector<std::string> line{_programs + "/" + program};
-  line.insert(line.end(), arguments.begin(), arguments.end());
-  Child child(line, environment(), _scratch.at(program + ".out"));
-  if (const int status = child.wait(); status != 0) {
-    throw std::runtime_error(program + " ended with " + std::to_string(status));
+std::string RoadInstance::firstLine(const Running& running) {
+  std::string output;
+  waitUntil("the first line of " + running.outputName, [&] {
+    output = _instance.read(running.outputName + ".out");
+    return output.find('\n') != std::string::npos;
+  });
+  return output.substr(0, output.find('\n'));
+}
+
+Dictionary RoadInstance::finish(Running& running) {
+  if (const int status = running.process->wait(kRunPatience); status != 0) {
+    throw std::runtime_error(running.outputName + " ended with " + std::to_string(status) + ": " +
+                             _instance.read(running.outputName + ".err"));
   }
-  return _scratch.read(program + ".out");
+  return parseFigures(lastLine(_instance.read(running.outputName + ".out")));
+}
+
+Dictionary RoadInstance::run(const std::string& program, const std::vector<std::string>& arguments) {
+  Running running = start(program, arguments);
+  return finish(running);
+}
+
+void RoadInstance::waitForEvents(uint64_t count) {
+  _expected += count;
+  uint64_t last = 0;
+  double lastChange = monotonicSeconds();
+  for (;;) {
+    const uint64_t now = statistics()["events"].unsignedValue();
+    if (now > _expected) {
+      throw std::runtime_error("more events came than were sent: " + std::to_string(now) + " for " +
+                               std::to_string(_expected));
+    }
+    if (now == _expected) return;
+    if (now != last) lastChange = monotonicSeconds();
+    last = now;
+    if (monotonicSeconds() - lastChange > kStandstillSeconds) {
+      throw std::runtime_error("events were lost: " + std::to_string(now) + " of " + std::to_string(_expected));
+    }
+    std::this_thread::sleep_for(std::chrono::milliseconds(5));
+  }
+}
+
+Dictionary RoadInstance::statistics() {
+  const std::optional<std::string> answer = _collector->get();
+  if (!answer.has_value()) throw std::runtime_error("the collector does not answer");
+  return parseFigures(*answer);
 }
 
 }  // namespace telvane::bench

@@ -3,59 +3,67 @@
 #include <sys/types.h>
 
 #include <memory>
+#include <optional>
 #include <string>
+#include <string_view>
 #include <vector>
 
-#include "tests/support/ScratchFolder.h"
-#include "tests/support/TestCertificates.h"
+#include "bench/KeptConnection.h"
+#include "bench/RoadBag.h"
+#include "foundation/Value.h"
+#include "tests/endtoend/Instance.h"
 
 namespace telvane::bench {
 
-// A child process whose end is this object's end.
-class Child {
- public:
-  // Starts a program with these arguments and environment; standard output goes to the file.
-  Child(const std::vector<std::string>& arguments, const std::vector<std::string>& environment,
-        const std::string& outputFile);
-  ~Child();
-  Child(const Child&) = delete;
-  Child& operator=(const Child&) = delete;
-  pid_t pid() const noexcept { return _pid; }
-  // Waits for the end and returns the exit status, -1 after a signal.
-  int wait();
-  void terminate();
-
- private:
-  pid_t _pid = -1;
-};
-
-// A scratch root with keys, certificate, signed bag and grants, a collector, and a daemon on it.
+// A whole Telvane for measurements, in a scratch root of its own: a collector that counts and drops, a daemon, and the
+// programs that send. Whatever does not start, ends badly or loses an event throws std::runtime_error with the reason.
 class RoadInstance {
  public:
-  // programs: the folder with the programs. Throws std::runtime_error with the reason when something does not start.
-  RoadInstance(std::string programs, const std::string& daemonLogLevel);
-  ~RoadInstance();
+  // A program that was started, with the name of its output.
+  struct Running {
+    std::unique_ptr<testing::ChildProcess> process;
+    std::string outputName;
+  };
 
-  pid_t daemonPID() const noexcept { return _daemon->pid(); }
-  std::string collectorURL(const std::string& path) const { return "https://" + _collectorAddress + path; }
-  const std::string& authorityFile() const noexcept { return _certificates.authorityFile(); }
-  // What the collector counted so far: a number of its /statistics.
-  uint64_t collected(const std::string& name) const;
-  // Runs a program of ours against this instance and returns what it printed.
-  std::string run(const std::string& program, const std::vector<std::string>& arguments) const;
+  RoadInstance();
+
+  std::string collectorURL(const std::string& path) const { return _instance.collectorURL(path); }
+  const std::string& authorityFile() const noexcept { return _instance.authorityFile(); }
+  testing::TestCertificates::Server serverCertificate() { return _instance.serverCertificate(); }
+  // Publishes a bag for the client type. postURL: the collector's by default.
+  void givenBag(int clientType, BagRules rules, const std::optional<std::string>& postURL = std::nullopt);
+
+  // Starts a daemon that knows nothing yet; returns when it accepts.
+  void startDaemon(std::string_view logLevel);
+  // Ends it in good order.
+  void endDaemon();
+  pid_t daemonPID() { return _instance.daemon().pid(); }
+
+  // Starts a program of ours.
+  Running start(const std::string& program, const std::vector<std::string>& arguments,
+                const std::optional<std::string>& outputName = std::nullopt);
+  // Waits until its output has this line.
+  void waitForLine(const Running& running, const std::string& line);
+  // Its first line, waited for.
+  std::string firstLine(const Running& running);
+  // Waits for its end and returns the figures that stand, as JSON, in its last line.
+  Dictionary finish(Running& running);
+  Dictionary run(const std::string& program, const std::vector<std::string>& arguments);
+
+  // Waits until the collector has so many events more than were waited for before. Throws when it stands still, and
+  // when there are too many.
+  void waitForEvents(uint64_t count);
+  // The bytes that the collector has been posted so far.
+  uint64_t collectedBytes() { return statistics()["bytes"].unsignedValue(); }
+  // All events that were waited for and have come.
+  uint64_t arrivedEvents() const noexcept { return _expected; }
 
  private:
-  std::vector<std::string> environment() const;
-  void writeConfiguration();
-  void startCollector();
-  void startDaemon(const std::string& logLevel);
+  Dictionary statistics();
 
-  const std::string _programs;
-  testing::ScratchFolder _scratch;
-  testing::TestCertificates _certificates;
-  std::string _collectorAddress;
-  std::unique_ptr<Child> _collector;
-  std::unique_ptr<Child> _daemon;
+  testing::Instance _instance;
+  std::optional<KeptConnection> _collector;
+  uint64_t _expected = 0;
 };
 
 }  // namespace telvane::bench

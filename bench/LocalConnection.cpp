@@ -1,7 +1,7 @@
 // What a call costs over the local connection: a client process sends events of 10 fields as fast as it can, a daemon
 // process answers each. Prints calls per second and the processor time of both processes per call.
 //
-//   ipc_benchmark [CALLS]
+//   telvane-bench-ipc [CALLS]
 
 #include <sys/resource.h>
 #include <sys/wait.h>

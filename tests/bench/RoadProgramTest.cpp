@@ -1,0 +1,60 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <cstdlib>
+
+#include "tests/support/ChildProcess.h"
+#include "tests/support/ScratchFolder.h"
+
+namespace telvane::testing {
+namespace {
+
+using ::testing::HasSubstr;
+using ::testing::Not;
+
+// The measuring program of bench/, run to its end.
+class RoadProgramTest : public ::testing::Test {
+ protected:
+  int run(std::vector<std::string> arguments) {
+    arguments.insert(arguments.begin(), std::string(TELVANE_PROGRAM_DIR) + "/telvane-bench-road");
+    const char* folder = std::getenv("TMPDIR");
+    const std::vector<std::string> environment{"TMPDIR=" + std::string(folder != nullptr ? folder : "/tmp")};
+    ChildProcess program(arguments, environment, {_scratch.at("out"), _scratch.at("err")});
+    return program.wait(std::chrono::seconds(100));
+  }
+  std::string output() const { return _scratch.read("out"); }
+  std::string errors() const { return _scratch.read("err"); }
+
+ private:
+  ScratchFolder _scratch;
+};
+
+TEST_F(RoadProgramTest, everyEventOfEveryPartArrivesOnce) {
+  const int status = run({"--events", "300", "--rounds", "1", "--posts", "5", "--session-events", "3",
+                          "--memory-events", "2000", "--idle-seconds", "0"});
+  ASSERT_EQ(status, 0) << errors();
+  // A session adds two of its own to a batched run; real-time events are preceded by 50 to warm up.
+  constexpr int kBatched = 300 + 4 * (300 + 2);
+  constexpr int kRealTime = 50 + 5;
+  constexpr int kSessions = 26 * 4 * (3 + 2);
+  constexpr int kMemory = 2000 + 2;
+  const std::string all = std::to_string(kBatched + kRealTime + kSessions + kMemory);
+  EXPECT_THAT(output(), HasSubstr("| " + all + " of " + all + " "));
+}
+
+TEST_F(RoadProgramTest, aFigureStandsBesideItsGoal) {
+  ASSERT_EQ(run({"--only", "batched", "--events", "300", "--rounds", "2"}), 0) << errors();
+  EXPECT_THAT(output(), HasSubstr("daemon, filters and white list: CPU ratio to ceiling"));
+  EXPECT_THAT(output(), HasSubstr("at most 1.60"));
+  EXPECT_THAT(output(), Not(HasSubstr("real-time event")));
+}
+
+TEST_F(RoadProgramTest, wrongUsageIsSaidInOneLineAndEndsWithTwo) {
+  EXPECT_EQ(run({"--rounds", "0"}), 2);
+  EXPECT_THAT(errors(), HasSubstr("--rounds"));
+  EXPECT_EQ(output(), "");
+  EXPECT_EQ(run({"--only", "everything"}), 2);
+}
+
+}  // namespace
+}  // namespace telvane::testing
