@@ -18,6 +18,8 @@ std::string contentOf(const ipc::Descriptor& descriptor) {
 }  // namespace
 
 void TalkingObject::invoke(ipc::Invocation invocation, ipc::ReplyBlock reply) {
+  // Kept before the call is told of: who waits for the call may want the kept reply at once.
+  if (invocation.operation == kKeep) keep(std::move(reply));
   _calls.add(invocation.arguments);
   switch (invocation.operation) {
     case kBlock:
@@ -28,14 +30,14 @@ void TalkingObject::invoke(ipc::Invocation invocation, ipc::ReplyBlock reply) {
       return;
     case kReadFile:
       return reply({Value(contentOf(invocation.descriptor))});
-    case kKeep: {
-      const std::lock_guard lock(_mutex);
-      _kept.push_back(std::move(reply));
-      return;
-    }
     default:
       return;
   }
+}
+
+void TalkingObject::keep(ipc::ReplyBlock reply) {
+  const std::lock_guard lock(_mutex);
+  _kept.push_back(std::move(reply));
 }
 
 size_t TalkingObject::keptReplies() const {

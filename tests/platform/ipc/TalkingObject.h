@@ -35,6 +35,7 @@ class TalkingObject final : public ipc::ExportedObject {
   void release(unsigned count = 1);
 
  private:
+  void keep(ipc::ReplyBlock reply);
   std::vector<ipc::ReplyBlock> takeKept();
 
   Gathered<Array> _calls;
