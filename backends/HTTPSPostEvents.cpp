@@ -29,6 +29,26 @@ bool isNumberedByClient(uint32_t clientType) { return clientType == 7 || clientT
 
 Value orMinusOne(const Value& number) { return number.isPresent() ? number : Value(-1); }
 
+// Whether JSON has a form for the value and for everything in it.
+bool isWritable(const Value& value) {
+  switch (value.kind()) {
+    case Value::Kind::Boolean:
+    case Value::Kind::Integer:
+    case Value::Kind::UnsignedInteger:
+    case Value::Kind::String:
+      return true;
+    case Value::Kind::Real:
+      return std::isfinite(*value.real());
+    case Value::Kind::Array:
+      return std::all_of(value.array()->begin(), value.array()->end(), isWritable);
+    case Value::Kind::Dictionary:
+      return std::all_of(value.dictionary()->begin(), value.dictionary()->end(),
+                         [](const DictionaryEntry& entry) { return isWritable(entry.value); });
+    default:
+      return false;
+  }
+}
+
 bool isSessionStop(uint16_t method, uint16_t respCode) { return method == kSessionMethod && respCode == kSessionStop; }
 
 }  // namespace
@@ -281,21 +301,11 @@ std::optional<HTTPSPostBackend::PostMessage> HTTPSPostBackend::createMessageForP
 }
 
 void HTTPSPostBackend::removeWhatJSONCannotHold(Dictionary& event) const {
+  // A list or dictionary goes as a whole when something in it cannot be written: the rest of the batch must not go with
+  // it.
   const auto isHeld = [this](const Value& value) {
-    switch (value.kind()) {
-      case Value::Kind::Boolean:
-      case Value::Kind::Integer:
-      case Value::Kind::UnsignedInteger:
-      case Value::Kind::String:
-        return true;
-      case Value::Kind::Real:
-        return std::isfinite(*value.real());
-      case Value::Kind::Array:
-      case Value::Kind::Dictionary:
-        return _allowNestedData;
-      default:
-        return false;
-    }
+    const bool isNested = value.isArray() || value.isDictionary();
+    return (_allowNestedData || !isNested) && isWritable(value);
   };
   const auto holdsEntry = [&isHeld](const DictionaryEntry& entry) { return isHeld(entry.value); };
   if (std::all_of(event.begin(), event.end(), holdsEntry)) return;

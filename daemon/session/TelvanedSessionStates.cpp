@@ -43,7 +43,7 @@ bool TelvanedSession::updateReportingStates() {
 }
 
 Value TelvanedSession::fetchReportingStates() const {
-  if (!_backends.has_value()) return {};
+  if (!_backends.has_value() || _backends->empty()) return {};
   Array names;
   for (const auto& [name, backend] : *_backends) {
     if (backend->state() == TelvaneBackendStateEnabled) names.append(Value(name));

@@ -122,6 +122,13 @@ Dictionary BackendFixture::lastEvent() {
   return event != nullptr ? *event : Dictionary();
 }
 
+Value BackendFixture::nestedTooDeep() {
+  constexpr int kLevels = 70;
+  Value value = 1;
+  for (int level = 0; level < kLevels; ++level) value = Array{Value(value)};
+  return value;
+}
+
 Dictionary BackendFixture::posted(Dictionary payload, uint16_t method, uint16_t respCode, uint32_t flag) {
   _backend->setBatchEvents(false);
   send(std::move(payload), method, respCode, flag);

@@ -72,6 +72,8 @@ class BackendFixture : public ::testing::Test {
   Dictionary lastEvent();
   // Sends one event at once and returns it as posted.
   Dictionary posted(Dictionary payload, uint16_t method = 7, uint16_t respCode = 2, uint32_t flag = 0);
+  // A list deeper than JSON is written.
+  static Value nestedTooDeep();
 
   SimulatedWorld _world;
   // What the backend is made with.

@@ -389,12 +389,26 @@ TEST_F(HTTPSPostEventsTest, nestedValuesStayWhereAllowed) {
   EXPECT_EQ(posted({{Key("list"), list}})["list"], list);
 }
 
+TEST_F(HTTPSPostEventsTest, aNestedValueThatCannotBeWrittenGoesAsAWhole) {
+  log().expectError("unable to handle key: list, value:");
+  log().expectError("unable to handle key: dict, value:");
+  _allowsNestedData = true;
+  makeBackend();
+  const double nan = std::numeric_limits<double>::quiet_NaN();
+  const Dictionary event = posted({{Key("list"), Array{1, Data::copyOf("x")}},
+                                   {Key("dict"), Dictionary{{Key("deep"), Array{Value(Dictionary{{Key("x"), nan}})}}}},
+                                   {Key("kept"), Array{1}}});
+  EXPECT_FALSE(event.contains("list"));
+  EXPECT_FALSE(event.contains("dict"));
+  EXPECT_EQ(event["kept"], Value(Array{1}));
+}
+
 TEST_F(HTTPSPostEventsTest, aBodyThatCannotBeWrittenIsNotPosted) {
   log().expectError("HTTPSPostBackend(createMessageForPostAndLogging): no JSON made");
   _allowsNestedData = true;
   makeBackend();
   backend().setBatchEvents(false);
-  EXPECT_EQ(send({{Key("list"), Array{Data::copyOf("x")}}}), std::nullopt);
+  EXPECT_EQ(send({{Key("list"), nestedTooDeep()}}), std::nullopt);
   EXPECT_EQ(posts().count(), 0u);
 }
 

@@ -187,7 +187,7 @@ TEST_F(HTTPSPostFlushTest, aBatchThatCannotBeWrittenIsLost) {
   log().expectError("no JSON made");
   _allowsNestedData = true;
   makeBackend();
-  send({{Key("list"), Array{Data::copyOf("x")}}});
+  send({{Key("list"), nestedTooDeep()}});
   EXPECT_EQ(flush()->error, failure("Nothing to flush: batched events were completely filtered out"));
   EXPECT_EQ(posts().count(), 0u);
 }
@@ -216,6 +216,26 @@ TEST_F(HTTPSPostFlushTest, userInfoIsFilteredByItselfToo) {
   ASSERT_EQ(events.size(), 1u);
   EXPECT_EQ((*events[0].dictionary())[kTelvaneUserInfoClientName], Value(TelvaneBackend::convertIntoSHA256("player")))
       << "user info has method 0, the event has not";
+}
+
+TEST_F(HTTPSPostFlushTest, userInfoIsDigestedTwiceInABatchAndOnceAlone) {
+  _client.set(kClientEntryFilters, Array{Value(Dictionary{{kFilterKey, "_clientName"}, {kFilterAction, "sha256"}})});
+  makeBackend();
+  const String once = TelvaneBackend::convertIntoSHA256("player");
+  sendMany(1);
+  flush();
+  EXPECT_EQ(lastEvent()[kTelvaneUserInfoClientName], Value(TelvaneBackend::convertIntoSHA256(once)));
+  EXPECT_EQ(posted({})[kTelvaneUserInfoClientName], Value(once));
+}
+
+TEST_F(HTTPSPostFlushTest, anEventIsJudgedByTheCategoryThatItSays) {
+  _userInfo = Dictionary{{kTelvaneUserInfoClientName, "player"}, {kEventMethod, 9}};
+  _client.set(kClientEntryEventWhitelist, Array{7});
+  makeBackend();
+  sendMany(1, 7);
+  EXPECT_EQ(flush()->error, failure("Nothing to flush: batched events were completely filtered out"));
+  EXPECT_TRUE(hasLine(log(), "Dropping event with category 9 as it is not whitelisted"));
+  EXPECT_EQ(posts().count(), 0u);
 }
 
 TEST_F(HTTPSPostFlushTest, aServerErrorDisablesTheBackend) {
