@@ -8,6 +8,7 @@
 #include "platform/system/AppendFile.h"
 #include "storebag/StorebagVerification.h"
 #include "tools/StorebagEnvelope.h"
+#include "tools/StorebagLint.h"
 
 namespace telvane {
 namespace {
@@ -30,7 +31,8 @@ Result<std::string> readableText(const Dictionary& bag) {
 }  // namespace
 
 int StorebagTool::run(int argc, const char* const* argv) {
-  CLI::App app("Makes keys for storebags, signs bags, and verifies and shows signed ones.", kName);
+  CLI::App app("Makes keys for storebags, signs bags, verifies and shows signed ones, and looks for mistakes in bags.",
+               kName);
   app.set_version_flag("--version", "telvane-storebag " TELVANE_VERSION);
   app.require_subcommand(1);
   auto* keygen = app.add_subcommand("keygen", "make a key pair");
@@ -45,6 +47,12 @@ int StorebagTool::run(int argc, const char* const* argv) {
   verify->add_option("ENVELOPE", _envelopeFile, "the signed envelope")->required();
   auto* show = app.add_subcommand("show", "print the bag in an envelope, without believing it");
   show->add_option("ENVELOPE", _envelopeFile, "the signed envelope")->required();
+  auto* lint = app.add_subcommand("lint", "name every mistake in a bag; exits 1 when one is an error");
+  lint->add_option("BAG", _bagFile, "a bag, as a property list or JSON, or a signed envelope")->required();
+  lint->footer(
+      "One finding per line: severity, place, what is wrong and what to do.\n"
+      "error: the bag does not do what it says. warning: it does, but that is probably not what was meant.\n"
+      "Exits 0 without errors, 1 with errors or when the file cannot be read, 2 on wrong usage.");
   try {
     app.parse(argc, argv);
   } catch (const CLI::ParseError& error) {
@@ -53,7 +61,7 @@ int StorebagTool::run(int argc, const char* const* argv) {
     return kWrongUsage;
   }
   const Result<void> done = dispatch(app.get_subcommands().front()->get_name());
-  if (!done.has_error()) return 0;
+  if (!done.has_error()) return _status;
   _errors << kName << ": " << done.error().description() << "\n";
   return kFailure;
 }
@@ -62,6 +70,7 @@ Result<void> StorebagTool::dispatch(const std::string& command) {
   if (command == "keygen") return keygen();
   if (command == "sign") return sign();
   if (command == "verify") return verify();
+  if (command == "lint") return lint();
   return show();
 }
 
@@ -124,6 +133,23 @@ Result<void> StorebagTool::show() {
   const Result<std::string> text = readableText(*bag);
   if (text.has_error()) return text.error();
   _output << *text;
+  return {};
+}
+
+Result<void> StorebagTool::lint() {
+  const Result<Data> bytes = readFile(_bagFile);
+  if (bytes.has_error()) return bytes.error();
+  const Result<LintReport> report = StorebagLint::lintFile(*bytes);
+  if (report.has_error()) {
+    return fault(_bagFile + ": " + report.error().description() + "; name a property list, JSON or a signed envelope");
+  }
+  for (const LintFinding& finding : report->findings()) {
+    const bool isError = finding.severity == LintFinding::Severity::Error;
+    _output << (isError ? "error: " : "warning: ") << finding.path << ": " << finding.text << "\n";
+  }
+  const size_t errors = report->count(LintFinding::Severity::Error);
+  _output << errors << " errors, " << report->count(LintFinding::Severity::Warning) << " warnings\n";
+  if (errors > 0) _status = kFailure;
   return {};
 }
 

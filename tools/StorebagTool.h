@@ -23,18 +23,21 @@ class StorebagTool {
   Result<void> sign();
   Result<void> verify();
   Result<void> show();
+  Result<void> lint();
   Result<void> dispatch(const std::string& command);
   Result<Data> readFile(const std::string& path) const;
 
   FileSystem& _files;
   std::ostream& _output;
   std::ostream& _errors;
+  int _status = 0;  // what a command that succeeded exits with
   // The command's arguments, as far as it has them.
   std::string _privateKeyFile;
   std::string _publicKeyFile;
   std::string _inputFile;
   std::string _outputFile;
   std::string _envelopeFile;
+  std::string _bagFile;
 };
 
 }  // namespace telvane

@@ -1,0 +1,197 @@
+#include "tools/StorebagLint.h"
+
+#include <fmt/format.h>
+
+#include <array>
+
+#include "foundation/Base64.h"
+#include "interfaces/BackendKind.h"
+#include "interfaces/BackendNames.h"
+#include "interfaces/StorebagKeys.h"
+#include "platform/PropertyList.h"
+#include "platform/log/NullLog.h"
+#include "storebag/StorebagMacros.h"
+#include "tools/ClientEntryLint.h"
+#include "tools/ClientListLint.h"
+#include "tools/LintText.h"
+#include "tools/MacroLint.h"
+#include "tools/StorebagEnvelope.h"
+
+namespace telvane {
+namespace {
+
+using linttext::pathTo;
+using linttext::quoted;
+using Audience = StorebagKeyLint::Audience;
+
+struct Environment {
+  Key key;
+  Audience audience;
+};
+
+constexpr Environment kEnvironments[] = {
+    {kEnvironmentDevelopment, Audience::InternalBuilds},
+    {kEnvironmentInternal, Audience::InternalBuilds},
+    {kEnvironmentSeed, Audience::Everybody},
+    {kEnvironmentRelease, Audience::Everybody},
+};
+
+constexpr std::array<std::string_view, 7> kBackendNames = {
+    kTelvaneBackendHTTPPost,     kTelvaneBackendHTTPPost2, kTelvaneBackendQRS, kTelvaneBackendDashboard,
+    kTelvaneBackendUploadServer, kTelvaneBackendWattbook,  kTelvaneBackendVDR};
+
+StorebagLevel levelOf(BackendKind kind) noexcept {
+  switch (kind) {
+    case BackendKind::HTTPSPost:
+      return StorebagLevel::HTTPSProfile;
+    case BackendKind::Dashboard:
+      return StorebagLevel::DashboardProfile;
+    case BackendKind::UploadServer:
+      return StorebagLevel::UploadProfile;
+    case BackendKind::Wattbook:
+    case BackendKind::VDR:
+    case BackendKind::Unknown:
+      break;
+  }
+  return StorebagLevel::PlainProfile;
+}
+
+std::optional<Data> decoded(const Value& text) {
+  return text.isString() ? base64DecodeIgnoringUnknownCharacters(text.text()) : std::nullopt;
+}
+
+}  // namespace
+
+Result<LintReport> StorebagLint::lintFile(const Data& bytes) {
+  const Result<Dictionary> written = storebagenvelope::parseBag(bytes);
+  if (written.has_error()) return written.error();
+  if (!written->contains(kEnvelopeBag) && !written->contains(kEnvelopeSignature)) return lintBag(*written);
+  LintReport report;
+  StorebagLint(report).lintEnvelope(*written, propertylist::parse(bytes).has_value());
+  return report;
+}
+
+LintReport StorebagLint::lintBag(const Dictionary& bag) {
+  LintReport report;
+  StorebagLint(report).lintInner(bag);
+  return report;
+}
+
+void StorebagLint::lintEnvelope(const Dictionary& envelope, bool isPropertyList) {
+  if (!isPropertyList)
+    _report.error({}, "is an envelope in JSON, which no device reads; make it with telvane-storebag sign");
+  StorebagKeyLint(_report, Audience::Everybody).lint({}, StorebagLevel::Envelope, envelope);
+  const Value& signature = envelope[kEnvelopeSignature];
+  if (const auto bytes = decoded(signature); signature.isString() && (!bytes.has_value() || bytes->empty())) {
+    _report.error(kEnvelopeSignature, "is no base64; make the envelope with telvane-storebag sign");
+  }
+  if (!envelope[kEnvelopeBag].isString()) return;
+  const std::optional<Data> bytes = decoded(envelope[kEnvelopeBag]);
+  if (!bytes.has_value()) {
+    _report.error(kEnvelopeBag, "is no base64; make the envelope with telvane-storebag sign");
+    return;
+  }
+  const Result<Value> bag = propertylist::parse(*bytes);
+  if (bag.has_error()) {
+    _report.error(kEnvelopeBag, fmt::format("holds no property list ({}); make the envelope with telvane-storebag sign",
+                                            bag.error().description()));
+  } else if (!bag->isDictionary()) {
+    _report.error(kEnvelopeBag, fmt::format("holds {}, not a bag; sign a dictionary", linttext::kindName(*bag)));
+  } else {
+    lintInner(*bag->dictionary());
+  }
+}
+
+void StorebagLint::lintInner(const Dictionary& bag) {
+  constexpr size_t kMostLevels = propertylist::Limits().maximumDepth;
+  if (Value(bag).depth(kMostLevels + 1) > kMostLevels) {
+    _report.error({},
+                  fmt::format("is nested deeper than {} levels, and no device reads it; make it flatter", kMostLevels));
+    return;
+  }
+  StorebagKeyLint(_report, Audience::Everybody).lint({}, StorebagLevel::Bag, bag);
+  lintMissingSections(bag);
+  MacroLint macros(_report, bag);
+  macros.lint();
+  _report.setNotes(macros.notes());
+  NullLog log;
+  const Dictionary expanded = expandStorebag(log, bag);
+  for (const Environment& environment : kEnvironments) {
+    const std::string place = pathTo({}, environment.key);
+    const Value& section = expanded[environment.key];
+    if (section.isDictionary()) {
+      lintSection(place, *section.dictionary(), environment.audience);
+    } else if (!(section == bag[environment.key])) {
+      StorebagKeyLint(_report, environment.audience)
+          .reportKind(place, storebagShapeName(StorebagShape::Section), section,
+                      "devices of this environment get no bag");
+    }
+  }
+}
+
+// The section for customers is a required key.
+void StorebagLint::lintMissingSections(const Dictionary& bag) {
+  for (const Environment& environment : kEnvironments) {
+    if (environment.key == kEnvironmentRelease || bag.contains(environment.key)) continue;
+    const StorebagKey* row = findStorebagKey(StorebagLevel::Bag, environment.key);
+    const bool isSeed = environment.key == kEnvironmentSeed;
+    _report.warning(pathTo({}, environment.key),
+                    fmt::format("is missing: {}; add it if you have such devices",
+                                isSeed ? "seed devices take release and log an error each time" : row->absent));
+  }
+}
+
+void StorebagLint::lintSection(const std::string& path, const Dictionary& section, Audience audience) {
+  StorebagKeyLint keys(_report, audience);
+  for (const DictionaryEntry& backend : section) {
+    if (!_report.mayGoOn()) return;
+    lintBackend(pathTo(path, backend.key), backend.key, backend.value, keys);
+  }
+}
+
+void StorebagLint::lintBackend(const std::string& path, std::string_view name, const Value& profile,
+                               StorebagKeyLint& keys) {
+  const BackendKind kind = backendKindForName(name);
+  if (kind == BackendKind::Unknown) return lintName(path, name);
+  if (!isBackendKindBuilt(kind)) {
+    _report.warning(path,
+                    "is a backend that this version does not make yet: devices log its name and go on without it; "
+                    "take it out unless newer devices are meant");
+  }
+  if (!profile.isDictionary()) return keys.reportKind(path, "a dictionary, a profile", profile, "no backend is made");
+  lintProfile(path, *profile.dictionary(), levelOf(kind), keys);
+}
+
+void StorebagLint::lintName(const std::string& path, std::string_view name) {
+  if (const StorebagKey* row = findStorebagKey(StorebagLevel::Bag, name)) {
+    _report.error(path, fmt::format("is a key of {}, not a backend; move \"{}\" to the top of the bag",
+                                    storebagLevelName(StorebagLevel::Bag), row->key.view()));
+    return;
+  }
+  const auto nearest = nearestName(name, kBackendNames);
+  _report.error(path,
+                fmt::format("is the name of no backend, so none is made; {}",
+                            nearest ? fmt::format("did you mean \"{}\"?", *nearest)
+                                    : fmt::format("write one of {}, or a name with \"{}\" in it",
+                                                  fmt::join(kBackendNames, ", "), kTelvaneBackendHTTPPost.view())));
+}
+
+void StorebagLint::lintProfile(const std::string& path, const Dictionary& profile, StorebagLevel level,
+                               StorebagKeyLint& keys) {
+  keys.lint(path, level, profile);
+  const Array* clients = level == StorebagLevel::HTTPSProfile ? profile[kProfileClients].array() : nullptr;
+  if (clients == nullptr) return;
+  const std::string place = pathTo(path, kProfileClients);
+  ClientEntryLint entries(_report, keys);
+  for (size_t i = 0; i < clients->size() && _report.mayGoOn(); ++i) {
+    const Value& entry = (*clients)[i];
+    if (entry.isDictionary()) {
+      entries.lint(pathTo(place, i), *entry.dictionary());
+    } else {
+      keys.reportKind(pathTo(place, i), "a dictionary, a client entry", entry, "it is passed over");
+    }
+  }
+  ClientListLint(_report).lint(place, *clients);
+}
+
+}  // namespace telvane
