@@ -7,6 +7,7 @@ namespace telvane {
 TelvanedService::TelvanedService(Platform& platform)
     : _platform(platform),
       _context(platform),
+      _sessionShared(platform),
       _agent(std::make_shared<TelvanedAgent>(_context, _connectivityShared, _sessionShared,
                                              std::make_shared<StorebagRetriever>(_context, _connectivityShared))) {}
 

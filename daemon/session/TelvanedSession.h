@@ -18,6 +18,8 @@ namespace telvane {
 
 // What all sessions of a process share. Made by the entry point; outlives every session.
 struct SessionShared {
+  explicit SessionShared(Platform& platform) : messageLog(platform) {}
+
   // Held while a flush's countdown is taken down: completions of one flush come from several backends' queues.
   Mutex flushLock;
   MessageLogFile messageLog;

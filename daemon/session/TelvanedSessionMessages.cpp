@@ -13,6 +13,23 @@ bool isHTTPSPostName(std::string_view name) {
   return name == kTelvaneBackendHTTPPost2.view() || name.find(kTelvaneBackendHTTPPost.view()) != std::string_view::npos;
 }
 
+// A URL is one word of one line: what would break the line is written as URLs write it.
+std::string withoutControlCharacters(std::string_view url) {
+  std::string text;
+  text.reserve(url.size());
+  for (const char character : url) {
+    const auto byte = static_cast<unsigned char>(character);
+    constexpr unsigned char kFirstPrintable = 0x20;
+    constexpr unsigned char kDelete = 0x7f;
+    if (byte < kFirstPrintable || byte == kDelete) {
+      fmt::format_to(std::back_inserter(text), "%{:02X}", byte);
+    } else {
+      text += character;
+    }
+  }
+  return text;
+}
+
 // One flush over several backends: the caller hears once, at the first error or when the last one is done.
 struct FlushCountdown {
   size_t backendsLeft;
@@ -183,7 +200,7 @@ void TelvanedSession::uploadFileAtPath(String fileURL, int extensionToken,
     log().error("uploadFileWithURL: File upload failed for {}", path);
   }
   _shared.messageLog.writeToLogFile("[uploadFileWithURL] Upload {} for file {}", success ? "succeeded" : "failed",
-                                    fileURL);
+                                    withoutControlCharacters(fileURL));
   if (completionHandler) completionHandler(success);
 }
 

@@ -27,11 +27,9 @@ Dictionary clientSessionInfo() {
           {kTelvaneSessionInfoRequireUserInfo, true}};
 }
 
-// What the real machine puts into a log is no part of the simulation: a client names its session by its address, and a
-// stop message tells the memory of the process that runs the test, whose digits compress one way or the other.
-std::string withoutTheMachinesOwn(const std::string& text) {
-  const std::string addressless = std::regex_replace(text, std::regex("client session 0x[0-9a-f]+"), "client session");
-  return std::regex_replace(addressless, std::regex("(Compressed file from|Sent) [0-9]+ (to|out of) [0-9]+"), "$1 $2");
+// A client names its session by its address, which is no part of the simulation.
+std::string withoutAddresses(const std::string& text) {
+  return std::regex_replace(text, std::regex("client session 0x[0-9a-f]+"), "client session");
 }
 
 // One client process that configures a session, sends ten events, flushes and ends.
@@ -87,7 +85,7 @@ std::string TelvanedServiceTest::run(uint64_t seed, SimulatedScheduler::Interlea
   }
   EXPECT_EQ(events, 24u) << "ten events, a start and a stop of each";
   world.end();
-  return withoutTheMachinesOwn(world.text());
+  return withoutAddresses(world.text());
 }
 
 TEST_F(TelvanedServiceTest, startsByOpeningItsServiceAndSaysSo) {
