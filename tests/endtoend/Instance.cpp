@@ -19,7 +19,7 @@
 namespace telvane::testing {
 namespace {
 
-constexpr auto kPatience = std::chrono::seconds(20);
+constexpr auto kPatience = std::chrono::seconds(40);
 constexpr auto kStep = std::chrono::milliseconds(5);
 
 std::string program(const std::string& name) { return std::string(TELVANE_PROGRAM_DIR) + "/" + name; }

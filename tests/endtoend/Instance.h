@@ -80,7 +80,7 @@ class Instance {
   std::unique_ptr<ChildProcess> _daemon;
 };
 
-// Waits until the condition holds, for at most 20 s; returns whether it does.
+// Waits until the condition holds, for at most 40 s; returns whether it does.
 bool eventually(const std::function<bool()>& condition);
 
 // A bag with one HTTPS backend "splunk" that takes every client in the US and posts to the URL, consent or not.

@@ -100,12 +100,25 @@ TEST_F(TelvanedSessionMessagesTest, aBlacklistedCategoryIsDroppedForThatBackendA
 }
 
 TEST_F(TelvanedSessionMessagesTest, theLastCollectorWithAResultAnswers) {
-  givenSection(sectionOf({{"splunk", StorebagBuilder::permissiveClient()},
-                          {"my_splunk_2", clientWith(kClientEntryEventBlacklist, Array{8})}}));
+  Dictionary second = clientWith(kClientEntryEventBlacklist, Array{8});
+  second.set(kClientEntryFilters, Array{Value(Dictionary{{kFilterKey, "mark"}, {kFilterAction, "sha256"}})});
+  givenSection(sectionOf({{"splunk", StorebagBuilder::permissiveClient()}, {"my_splunk_2", second}}));
   const auto client = startTalkativeSession();
-  const Answer first = client->send(7, 1, {{Key("k"), "v"}});
-  ASSERT_TRUE(first[0].isString()) << log().text();
-  EXPECT_TRUE(client->send(8)[0].isString());
+  const Dictionary payload{{Key("mark"), "plain"}};
+  const Answer ofTheSecond = client->send(7, 1, payload);
+  EXPECT_THAT(std::string(ofTheSecond[0].text()), ::testing::HasSubstr("\"mark\": \"a116c9"));
+  const Answer ofTheFirst = client->send(8, 1, payload);
+  EXPECT_THAT(std::string(ofTheFirst[0].text()), ::testing::HasSubstr("\"mark\": \"plain\""))
+      << "the second takes no such events, so it has no result";
+}
+
+TEST_F(TelvanedSessionMessagesTest, onlyCollectorsAnswerOfWhomClientsMayHear) {
+  givenSection(StorebagBuilder::section("qrs"));
+  const auto client = startTalkativeSession();
+  const Answer answer = client->send(7);
+  ASSERT_TRUE(answer.values.has_value());
+  EXPECT_EQ(answer[0], Value());
+  EXPECT_EQ(postedEvents(7, 1).size(), 1u);
 }
 
 TEST_F(TelvanedSessionMessagesTest, sendsToEveryBackend) {
@@ -174,6 +187,31 @@ TEST_F(TelvanedSessionMessagesTest, uploadsThatNoBackendTakesFail) {
   EXPECT_TRUE(hasLine(log(), "uploadFileAtPath: Uploading file for session 42"));
 }
 
+TEST_F(TelvanedSessionMessagesTest, uploadsWithoutBackendsFailToo) {
+  const auto client = openSession();
+  log().expectError("uploadFileWithURL: File upload failed for /tmp/log");
+  log().expectError("uploadLogData: Log data array upload failed");
+  EXPECT_EQ(client->ask(ClientSessionOperation::UploadFileAtPath, {"file:///tmp/log"})[0], Value(false));
+  EXPECT_EQ(client->ask(ClientSessionOperation::UploadLogData, {Array{Value(Dictionary())}})[0], Value(false));
+}
+
+TEST_F(TelvanedSessionMessagesTest, sharedDataAccompaniesEventsUntilItIsTakenAway) {
+  givenStorebag();
+  const auto client = startSession(sessionInfoIn("a", 0));
+  client->tell(ClientSessionOperation::UpdateSharedDataWithDictionary, {Dictionary{{Key("k"), 1}, {Key("kept"), 2}}});
+  client->send(7);
+  client->tell(ClientSessionOperation::UpdateSharedDataForKey, {"k", Value()});
+  client->tell(ClientSessionOperation::UpdateSharedDataForKey, {"new", 3});
+  client->send(8);
+  client->flush();
+  ASSERT_EQ(postedEvents(7, 1).size(), 1u);
+  EXPECT_THAT(postedEvents(7, 1)[0], HasEntry("k", 1));
+  ASSERT_EQ(postedEvents(8, 1).size(), 1u);
+  EXPECT_FALSE(postedEvents(8, 1)[0].contains("k"));
+  EXPECT_THAT(postedEvents(8, 1)[0], HasEntry("kept", 2));
+  EXPECT_THAT(postedEvents(8, 1)[0], HasEntry("new", 3));
+}
+
 TEST_F(TelvanedSessionMessagesTest, theAggregatorHearsEveryMessageWithTheUserInfoAdded) {
   givenStorebag();
   const auto client = startSession(sessionInfo(), userInfo(), true);
@@ -229,6 +267,32 @@ TEST_F(TelvanedSessionMessagesTest, aDigestKeyReachesTheBackendOfThatNameAlone) 
   ASSERT_EQ(plain.size(), 1u);
   EXPECT_TRUE(RecordingConnectivity::header(digested[0].request, "X-TVN-DIGEST").has_value());
   EXPECT_FALSE(RecordingConnectivity::header(plain[0].request, "X-TVN-DIGEST").has_value());
+}
+
+TEST_F(TelvanedSessionMessagesTest, aChangeOfUserInfoForgetsTheDigestsAlgorithmAndKeepsItsKey) {
+  givenSection(StorebagBuilder::section("qrs"));
+  Dictionary info = sessionInfo();
+  info.set(kTelvaneSessionInfoBatchEvent, false);
+  const auto client = startSession(info);
+  const auto hasDigest = [this, &client] {
+    client->send(7);
+    const auto requests = world.network().requestsTo(StorebagBuilder::kPostURL);
+    return RecordingConnectivity::header(requests.back().request, "X-TVN-DIGEST").has_value();
+  };
+  client->tell(ClientSessionOperation::SetDigestKey, {Data::copyOf("key"), 1});
+  EXPECT_FALSE(hasDigest()) << "no such algorithm";
+  client->fetchStates(userInfo("other"));
+  EXPECT_TRUE(hasDigest());
+}
+
+TEST_F(TelvanedSessionMessagesTest, anAggregatorIsToldWhenTheSessionEnds) {
+  givenStorebag();
+  const auto root = startSession(sessionInfoIn("a", 0, 1), userInfo(), true);
+  auto child = startSession(sessionInfoIn("a", 1, 2), userInfo(), true);
+  const size_t before = log().count("shutdownSessionAggregation: Disable aggregation module for session 2");
+  child->close();
+  world.advance(std::chrono::seconds(1));
+  EXPECT_EQ(log().count("shutdownSessionAggregation: Disable aggregation module for session 2"), before + 1);
 }
 
 }  // namespace

@@ -1,0 +1,52 @@
+#pragma once
+
+#include <cstdint>
+#include <string>
+
+#include "foundation/Value.h"
+
+namespace telvane::testing {
+
+// What a client process is to do, step by step: made by a test, carried out by the program telvane-scripted-client,
+// which says on standard output what it was told, one line for each step that is answered. A step is for the session
+// that was opened last. Values may be anything, also what no property list holds. A value.
+//
+//   ClientScript script;
+//   script.open(sessionInfo, userInfo).configure().send(21, 1, Dictionary{{Key("n"), 1}}).flush();
+class ClientScript {
+ public:
+  ClientScript& open(Dictionary sessionInfo, Value userInfo = {});
+  // "configured: [names]", or "configured: nothing".
+  ClientScript& configure();
+  // "states: [names]", or "states: nothing".
+  ClientScript& fetchStates(Value userInfo);
+  ClientScript& send(uint16_t category, uint16_t type, Value payload = {}, uint32_t flag = 0);
+  // "flushed: ok", or "flushed: error CODE TEXT".
+  ClientScript& flush();
+  ClientScript& share(Dictionary sharedData);
+  ClientScript& setDigestKey(const std::string& key, int32_t algorithm = 0);
+  ClientScript& sendOneShot(Dictionary sessionInfo, Value userInfo, uint16_t category, uint16_t type, Value payload);
+  // Says "waiting" and waits for a line on standard input, or its end.
+  ClientScript& wait();
+
+  // The property list that the program reads.
+  std::string text() const;
+
+  // The program's side. Steps are dictionaries with the step's name under kStep and its arguments under the others.
+  static Array parse(const std::string& text);
+  static constexpr char kStep[] = "step";
+  static constexpr char kSessionInfo[] = "sessionInfo";
+  static constexpr char kUserInfo[] = "userInfo";
+  static constexpr char kCategory[] = "category";
+  static constexpr char kType[] = "type";
+  static constexpr char kPayload[] = "payload";
+  static constexpr char kFlag[] = "flag";
+  static constexpr char kKey[] = "key";
+  static constexpr char kAlgorithm[] = "algorithm";
+
+ private:
+  ClientScript& add(const char* name, Dictionary arguments = {});
+  Array _steps;
+};
+
+}  // namespace telvane::testing
