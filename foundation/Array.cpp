@@ -13,8 +13,8 @@ constexpr size_t kFirstRoom = 4;
 
 Array::Array(std::initializer_list<Value> values) {
   if (values.size() == 0) return;
-  _storage = new ArrayStorage;
-  _storage->values = values;
+  _storage = ArrayStorage::withRoom(values.size());
+  _storage->append(values.begin(), values.end());
 }
 
 Array::Array(const Array& other) noexcept : _storage(other._storage) {
@@ -35,24 +35,24 @@ Array& Array::operator=(Array&& other) noexcept {
 
 void Array::release(ArrayStorage* storage) noexcept { SharedStorage::release(storage); }
 
-size_t Array::size() const noexcept { return _storage == nullptr ? 0 : _storage->values.size(); }
+size_t Array::size() const noexcept { return _storage == nullptr ? 0 : _storage->size; }
 
 const Value& Array::operator[](size_t index) const noexcept {
-  return index < size() ? _storage->values[index] : Value::none();
+  return index < size() ? _storage->begin()[index] : Value::none();
 }
 
 void Array::reserve(size_t count) {
-  if (count > 0) writable(count).values.reserve(count);
+  if (count > 0) writable(count);
 }
 
-void Array::append(Value value) { writable(size() + 1).values.push_back(std::move(value)); }
+void Array::append(Value value) { writable(size() + 1).append(std::move(value)); }
 
 void Array::replace(size_t index, Value value) {
   assert(index < size());
-  writable(size()).values[index] = std::move(value);
+  writable(size()).begin()[index] = std::move(value);
 }
 
-const Value* Array::begin() const noexcept { return _storage == nullptr ? nullptr : _storage->values.data(); }
+const Value* Array::begin() const noexcept { return _storage == nullptr ? nullptr : _storage->begin(); }
 
 const Value* Array::end() const noexcept { return begin() + size(); }
 
@@ -62,13 +62,13 @@ TELVANE_EXPORT bool operator==(const Array& a, const Array& b) noexcept {
 
 ArrayStorage& Array::writable(size_t room) {
   if (_storage == nullptr) {
-    _storage = new ArrayStorage;
-    _storage->values.reserve(std::max(room, kFirstRoom));
+    _storage = ArrayStorage::withRoom(std::max(room, kFirstRoom));
   } else if (!_storage->count.isUnique()) {
-    auto own = std::make_unique<ArrayStorage>();
-    own->values.reserve(std::max(room, size()));
-    own->values.insert(own->values.end(), begin(), end());
-    release(std::exchange(_storage, own.release()));
+    ArrayStorage* own = ArrayStorage::withRoom(std::max(room, size()));
+    own->append(begin(), end());
+    release(std::exchange(_storage, own));
+  } else if (room > _storage->capacity) {
+    _storage = ArrayStorage::grown(_storage, room);
   }
   return *_storage;
 }

@@ -8,14 +8,6 @@ namespace {
 
 constexpr size_t kFirstRoom = 8;
 
-std::unique_ptr<DictionaryStorage> copyOf(const DictionaryStorage& storage, size_t room) {
-  auto copy = std::make_unique<DictionaryStorage>();
-  copy->entries.reserve(std::max(room, storage.entries.size()));
-  copy->entries.insert(copy->entries.end(), storage.entries.begin(), storage.entries.end());
-  if (storage.index != nullptr) copy->index = std::make_unique<DictionaryIndex>(*storage.index);
-  return copy;
-}
-
 }  // namespace
 
 Dictionary::Dictionary(std::initializer_list<DictionaryItem> items) {
@@ -41,16 +33,16 @@ Dictionary& Dictionary::operator=(Dictionary&& other) noexcept {
 
 void Dictionary::release(DictionaryStorage* storage) noexcept { SharedStorage::release(storage); }
 
-size_t Dictionary::size() const noexcept { return _storage == nullptr ? 0 : _storage->entries.size(); }
+size_t Dictionary::size() const noexcept { return _storage == nullptr ? 0 : _storage->size; }
 
 const Value& Dictionary::operator[](const Key& key) const noexcept {
   const uint32_t position = _storage == nullptr ? DictionaryStorage::kNotFound : _storage->find(key.view(), key.hash());
-  return position == DictionaryStorage::kNotFound ? Value::none() : _storage->entries[position].value;
+  return position == DictionaryStorage::kNotFound ? Value::none() : _storage->begin()[position].value;
 }
 
 const Value& Dictionary::operator[](std::string_view key) const noexcept {
   const uint32_t position = _storage == nullptr ? DictionaryStorage::kNotFound : _storage->find(key);
-  return position == DictionaryStorage::kNotFound ? Value::none() : _storage->entries[position].value;
+  return position == DictionaryStorage::kNotFound ? Value::none() : _storage->begin()[position].value;
 }
 
 // What is set is present, so an absent value means that the key is not there.
@@ -101,12 +93,10 @@ void Dictionary::addEntriesFrom(const Dictionary& other) {
 }
 
 void Dictionary::reserve(size_t count) {
-  if (count > 0) writable(count).entries.reserve(count);
+  if (count > 0) writable(count);
 }
 
-const DictionaryEntry* Dictionary::begin() const noexcept {
-  return _storage == nullptr ? nullptr : _storage->entries.data();
-}
+const DictionaryEntry* Dictionary::begin() const noexcept { return _storage == nullptr ? nullptr : _storage->begin(); }
 
 const DictionaryEntry* Dictionary::end() const noexcept { return begin() + size(); }
 
@@ -114,23 +104,24 @@ TELVANE_EXPORT bool operator==(const Dictionary& a, const Dictionary& b) noexcep
   if (a.size() != b.size()) return false;
   return std::all_of(a.begin(), a.end(), [&b](const DictionaryEntry& entry) {
     const uint32_t position = b._storage->find(entry.key, entry.hash);
-    return position != DictionaryStorage::kNotFound && b._storage->entries[position].value == entry.value;
+    return position != DictionaryStorage::kNotFound && b._storage->begin()[position].value == entry.value;
   });
 }
 
 bool Dictionary::replace(std::string_view key, uint32_t hash, Value& value) {
   const uint32_t position = _storage == nullptr ? DictionaryStorage::kNotFound : _storage->find(key, hash);
   if (position == DictionaryStorage::kNotFound) return false;
-  writable(size()).entries[position].value = std::move(value);
+  writable(size()).begin()[position].value = std::move(value);
   return true;
 }
 
 DictionaryStorage& Dictionary::writable(size_t room) {
   if (_storage == nullptr) {
-    _storage = new DictionaryStorage;
-    _storage->entries.reserve(std::max(room, kFirstRoom));
+    _storage = DictionaryStorage::withRoom(std::max(room, kFirstRoom));
   } else if (!_storage->count.isUnique()) {
-    release(std::exchange(_storage, copyOf(*_storage, room).release()));
+    release(std::exchange(_storage, _storage->copy(room)));
+  } else if (room > _storage->capacity) {
+    _storage = DictionaryStorage::grown(_storage, room);
   }
   return *_storage;
 }

@@ -15,11 +15,15 @@ void SharedStorage::release(SharedStorage* storage) noexcept {
 
 void SharedStorage::freeOne(SharedStorage* storage, SharedStorage*& unowned) noexcept {
   if (storage->kind == Value::Kind::Array) {
-    std::unique_ptr<ArrayStorage> array(static_cast<ArrayStorage*>(storage));
-    for (Value& value : array->values) releaseContent(value, unowned);
+    auto* array = static_cast<ArrayStorage*>(storage);
+    for (Value& value : *array) releaseContent(value, unowned);
+    array->truncate(0);
+    ArrayStorage::free(array);
   } else {
-    std::unique_ptr<DictionaryStorage> dictionary(static_cast<DictionaryStorage*>(storage));
-    for (DictionaryEntry& entry : dictionary->entries) releaseContent(entry.value, unowned);
+    auto* dictionary = static_cast<DictionaryStorage*>(storage);
+    for (DictionaryEntry& entry : *dictionary) releaseContent(entry.value, unowned);
+    dictionary->truncate(0);
+    DictionaryStorage::free(dictionary);
   }
 }
 
