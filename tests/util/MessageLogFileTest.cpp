@@ -192,6 +192,16 @@ TEST_F(MessageLogFileTest, aNewerFileOfSomebodyElsesIsSeenWhenTheCurrentOneExpir
   EXPECT_TRUE(hasNoLine(log(), "Deleted expired"));
 }
 
+TEST_F(MessageLogFileTest, aYoungFileUnderTheNameOfTheCurrentOneTakesItsPlace) {
+  write();
+  advance(kDay + 1s);
+  givenFile(newYear, 1h, "put there by somebody\n");
+  write("next");
+  EXPECT_THAT(files(), ElementsAre(newYear));
+  EXPECT_EQ(content(newYear), "put there by somebody\n(2026-01-02 00:00:01 +0000) [backend] next\n");
+  EXPECT_THAT(submitted(), IsEmpty());
+}
+
 TEST_F(MessageLogFileTest, theFolderIsNotLookedAtWhileTheFileIsYoung) {
   write();
   givenFile(nameAt("2026-01-01-12-00-00"), -12h);
