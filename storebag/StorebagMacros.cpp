@@ -17,12 +17,6 @@ Array splitAtCommas(std::string_view text) {
   }
 }
 
-const Value* macroNamedBy(const Value& value, const Dictionary& macros) {
-  if (!value.isString() || !value.text().starts_with(kMacroPrefix)) return nullptr;
-  const Value& macro = macros[value.text()];
-  return macro.isPresent() ? &macro : nullptr;
-}
-
 // Recursion is bounded by the depth that the property-list parser admits.
 Value expanded(Log& log, const Value& value, const Dictionary& macros) {
   if (const Value* macro = macroNamedBy(value, macros)) {
@@ -45,6 +39,14 @@ Value expanded(Log& log, const Value& value, const Dictionary& macros) {
 }
 
 }  // namespace
+
+bool isMacroName(const Value& value) { return value.isString() && value.text().starts_with(kMacroPrefix); }
+
+const Value* macroNamedBy(const Value& value, const Dictionary& macros) {
+  if (!isMacroName(value)) return nullptr;
+  const Value& macro = macros[value.text()];
+  return macro.isPresent() ? &macro : nullptr;
+}
 
 Dictionary splitMacroValues(const Dictionary& sharedValues) {
   Dictionary macros;

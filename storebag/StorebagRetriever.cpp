@@ -10,9 +10,9 @@
 #include "interfaces/StorebagKeys.h"
 #include "platform/PropertyList.h"
 #include "storebag/StorebagMacros.h"
+#include "storebag/StorebagSection.h"
 #include "storebag/StorebagVerification.h"
 #include "util/DataHelpers.h"
-#include "util/UserDefaultsEnvironment.h"
 
 namespace telvane {
 namespace {
@@ -58,22 +58,8 @@ StorebagRetriever::FetchResult StorebagRetriever::fetchStorebagForEnvironmentAnd
     }
     return result;
   }
-  const std::string_view environment = environmentNameForType(userDefaultsEnvironment(_context));
-  const Dictionary* section = (*bag)[environment].dictionary();
-  if (section == nullptr && userDefaultsEnvironment(_context) == kEnvironmentTypeSeed) {
-    log.error("fetchStorebagForEnvironmentAndClientType: Seed section is missing in the storebag.");
-    section = (*bag)[kEnvironmentRelease].dictionary();
-  }
-  if (section == nullptr) {
-    log.error(
-        "fetchStorebagForEnvironmentAndClientType: Could not find storebag for client type {} with {} environment",
-        clientType, environment.empty() ? "(null)" : environment);
-    return result;
-  }
-  result.section = *section;
-  if (bag->contains(kStorebagReleaseTimeout)) {
-    result.section->set(kStorebagReleaseTimeout, (*bag)[kStorebagReleaseTimeout]);
-  }
+  result.section = storebagSectionForEnvironment(_context, *bag, clientType).content;
+  if (!result.section.has_value()) return result;
   result.version = (*bag)[kStorebagVersion];
   if (const Value& refreshCycle = (*bag)[kStorebagRefreshCycle]; refreshCycle.isPresent()) {
     const int64_t seconds = std::min(refreshCycle.integerValue(), kMaximumRefreshCycle);

@@ -19,6 +19,10 @@ constexpr char kName[] = "telvane-storebag";
 
 Error fault(const std::string& text) { return Error::withDescription("TelvaneStorebag", kFailure, text); }
 
+std::string counted(size_t count, const char* what) {
+  return std::to_string(count) + " " + what + (count == 1 ? "" : "s");
+}
+
 // Property lists hold more than JSON does; what JSON cannot show is shown as a property list.
 Result<std::string> readableText(const Dictionary& bag) {
   Result<std::string> text = json::serialize(bag, json::Style::Pretty);
@@ -47,6 +51,7 @@ int StorebagTool::run(int argc, const char* const* argv) {
   verify->add_option("ENVELOPE", _envelopeFile, "the signed envelope")->required();
   auto* show = app.add_subcommand("show", "print the bag in an envelope, without believing it");
   show->add_option("ENVELOPE", _envelopeFile, "the signed envelope")->required();
+  _explain.addTo(app);
   auto* lint = app.add_subcommand("lint", "name every mistake in a bag; exits 1 when one is an error");
   lint->add_option("BAG", _bagFile, "a bag, as a property list or JSON, or a signed envelope")->required();
   lint->footer(
@@ -71,6 +76,7 @@ Result<void> StorebagTool::dispatch(const std::string& command) {
   if (command == "sign") return sign();
   if (command == "verify") return verify();
   if (command == "lint") return lint();
+  if (command == "explain") return _explain.run();
   return show();
 }
 
@@ -148,7 +154,8 @@ Result<void> StorebagTool::lint() {
     _output << (isError ? "error: " : "warning: ") << finding.path << ": " << finding.text << "\n";
   }
   const size_t errors = report->count(LintFinding::Severity::Error);
-  _output << errors << " errors, " << report->count(LintFinding::Severity::Warning) << " warnings\n";
+  _output << counted(errors, "error") << ", " << counted(report->count(LintFinding::Severity::Warning), "warning")
+          << "\n";
   if (errors > 0) _status = kFailure;
   return {};
 }

@@ -5,15 +5,17 @@
 
 #include "foundation/Error.h"
 #include "platform/FileSystem.h"
+#include "tools/StorebagExplain.h"
 
 namespace telvane {
 
-// The program telvane-storebag: makes keys, signs bags, verifies and shows envelopes. Made for one command line.
+// The program telvane-storebag: makes keys, signs bags, verifies and shows envelopes, explains what bags do. Made for
+// one command line.
 class StorebagTool {
  public:
   // files and streams outlive the tool. Results go to output, faults as one line each to errors.
   StorebagTool(FileSystem& files, std::ostream& output, std::ostream& errors)
-      : _files(files), _output(output), _errors(errors) {}
+      : _files(files), _output(output), _errors(errors), _explain(files, output) {}
 
   // Does what the command line says. Returns the exit status: 0, 1 on failure, 2 on wrong usage.
   int run(int argc, const char* const* argv);
@@ -30,6 +32,7 @@ class StorebagTool {
   FileSystem& _files;
   std::ostream& _output;
   std::ostream& _errors;
+  StorebagExplain _explain;
   int _status = 0;  // what a command that succeeded exits with
   // The command's arguments, as far as it has them.
   std::string _privateKeyFile;

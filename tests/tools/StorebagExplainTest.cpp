@@ -1,0 +1,533 @@
+// What explain says, held against what a real backend of the same bag and device decides.
+#include "tools/StorebagExplain.h"
+
+#include <gmock/gmock.h>
+
+#include <sstream>
+
+#include "interfaces/BackendNames.h"
+#include "interfaces/DefaultsKeys.h"
+#include "interfaces/SessionKeys.h"
+#include "interfaces/StorebagKeys.h"
+#include "platform/JSON.h"
+#include "platform/PropertyList.h"
+#include "platform/system/PosixFileSystem.h"
+#include "tests/backends/BackendFixture.h"
+#include "tests/support/ScratchFolder.h"
+#include "tests/support/StorebagBuilder.h"
+#include "tools/StorebagTool.h"
+
+namespace telvane::testing {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::HasSubstr;
+using ::testing::Not;
+using ::testing::StartsWith;
+
+using Arguments = std::vector<std::string>;
+
+class StorebagExplainTest : public BackendFixture {
+ protected:
+  // The device and the session of the fixture.
+  static Arguments fixtureCase() {
+    return {"--client-type", "6",       "--client-name",    "player",     "--service-name",      "StreamMediaPlayer",
+            "--country",     "US",      "--product-family", "TelvaneBox", "--hardware",          "Box2,1",
+            "--consent",     "on",      "--batch-events",   "on",         "--framework-version", "8.1",
+            "--environment", "release", "--sampling-factor"};
+  }
+  // Runs the program; "@bag" is the file that givenBag wrote.
+  int run(Arguments arguments) {
+    _output.str("");
+    _errors.str("");
+    arguments.insert(arguments.begin(), "telvane-storebag");
+    std::vector<const char*> pointers;
+    for (std::string& argument : arguments) {
+      if (argument.starts_with("@")) argument = _scratch.at(argument.substr(1));
+      pointers.push_back(argument.c_str());
+    }
+    return StorebagTool(_files, _output, _errors).run(static_cast<int>(pointers.size()), pointers.data());
+  }
+  std::string output() const { return _output.str(); }
+  std::string errors() const { return _errors.str(); }
+  void givenBag(const Dictionary& bag) {
+    _scratch.write("bag", propertylist::serialize(bag, propertylist::Format::XML).value().view());
+  }
+  Dictionary bag() const {
+    Dictionary section;
+    section.set(kName, profile());
+    return {{kStorebagVersion, "7"}, {kEnvironmentRelease, section}};
+  }
+  // Explains the bag on the fixture's device, with these options laid over its own.
+  Dictionary explain(double factor = 0, const Arguments& options = {}) {
+    Arguments arguments = fixtureCase();
+    arguments.push_back(fmt::format("{}", factor));
+    for (size_t i = 0; i + 1 < options.size(); i += 2) replace(arguments, options[i], options[i + 1]);
+    arguments.insert(arguments.begin(), {"explain", "@bag", "--json"});
+    EXPECT_EQ(run(arguments), 0) << errors();
+    const Result<Value> parsed = json::parse(output());
+    if (parsed.has_error() || !parsed->isDictionary()) {
+      ADD_FAILURE() << "the output is no JSON object: " << output();
+      return {};
+    }
+    return *parsed->dictionary();
+  }
+  static void replace(Arguments& arguments, const std::string& option, const std::string& value) {
+    const auto found = std::find(arguments.begin(), arguments.end(), option);
+    if (found != arguments.end()) {
+      *(found + 1) = value;
+    } else {
+      arguments.insert(arguments.end(), {option, value});
+    }
+  }
+  // The only backend of the explained bag.
+  Dictionary explainBackend(double factor = 0, const Arguments& options = {}) {
+    givenBag(bag());
+    const Dictionary explained = explain(factor, options);
+    const Array* backends = explained["backends"].array();
+    if (backends == nullptr || backends->size() != 1) {
+      ADD_FAILURE() << "one backend was to be explained: " << output();
+      return {};
+    }
+    return *(*backends)[0].dictionary();
+  }
+  static std::string text(const Dictionary& fields, const char* key) { return std::string(fields[key].text()); }
+  // The reason of the state, as "step: word".
+  static std::string because(const Dictionary& backend) {
+    const Dictionary* reason = backend["because"].dictionary();
+    return reason != nullptr ? text(*reason, "gate") + ": " + text(*reason, "outcome") : "nothing";
+  }
+  static std::vector<std::string> texts(const Value& list) {
+    std::vector<std::string> texts;
+    for (const Value& element : *list.array()) texts.emplace_back(element.text());
+    return texts;
+  }
+  static const Dictionary& only(const Dictionary& explained) {
+    return *(*explained["backends"].array())[0].dictionary();
+  }
+  std::vector<std::string> logged() {
+    std::vector<std::string> lines;
+    for (const LogLine& line : log().lines()) {
+      if (line.level != LogLevel::Info) lines.push_back(line.message);
+    }
+    return withoutIdentifiers(lines);
+  }
+  // Lines without those that tell the device's identifiers, which explain does not know.
+  static std::vector<std::string> withoutIdentifiers(std::vector<std::string> lines) {
+    std::erase_if(lines, [](const std::string& line) { return line.starts_with("getPersistentIdentifierFor"); });
+    return lines;
+  }
+  // Explains the bag, makes a real backend of it with this sampling factor, and compares state, batching and log.
+  void expectTheSame(const Dictionary& explained, double factor) {
+    givenSamplingFactor(factor);
+    static_cast<void>(context());
+    log().clear();
+    makeUndecidedBackend();
+    const uint32_t state = backend().updateState();
+    EXPECT_EQ(explained["stateNumber"], Value(state)) << output();
+    EXPECT_EQ(explained["batchesEvents"], Value(backend().batchEvents()));
+    EXPECT_EQ(withoutIdentifiers(texts(explained["log"])), logged());
+  }
+
+  ScratchFolder _scratch;
+  PosixFileSystem _files{Paths{}};
+  std::ostringstream _output;
+  std::ostringstream _errors;
+};
+
+struct GateCase {
+  Key key;
+  Value value;
+  const char* because;
+};
+
+// One key of an otherwise open entry at a time; the device's sampling factor is 0.5.
+std::vector<GateCase> gateCases() {
+  const Array perCountry{Value(Dictionary{{kPerCountryCountry, Array{"US"}}, {kPerCountryThreshold, 0.2}})};
+  const Array elsewhere{Value(Dictionary{{kPerCountryCountry, Array{"DE"}}, {kPerCountryThreshold, 0.2}})};
+  return {
+      {kClientEntryClient, "other,PLAYER", "sampling: pass"},
+      {kClientEntryClient, "other", "matching entry: fail"},
+      {kClientEntryService, "media", "sampling: pass"},
+      {kClientEntryService, "mail", "matching entry: fail"},
+      {kClientEntryEnabledSince, "8.1", "sampling: pass"},
+      {kClientEntryEnabledSince, "8.2", "matching entry: fail"},
+      {kClientEntryExpedite, 1, "sampling: pass"},
+      {kClientEntryExpedite, 0, "sampling: pass"},
+      {kClientEntryLocaleWhitelist, Array{"US"}, "sampling: pass"},
+      {kClientEntryLocaleWhitelist, Array{"FR"}, "country: fail"},
+      {kClientEntryLocaleWhitelist, Array(), "country: fail"},
+      {kClientEntryDeviceWhitelist, Array{"Box"}, "sampling: pass"},
+      {kClientEntryDeviceWhitelist, Array{"Phone"}, "device whitelist: fail"},
+      {kClientEntryDeviceBlacklist, Array{"Box1"}, "sampling: pass"},
+      {kClientEntryDeviceBlacklist, Array{"Box2"}, "device blacklist: fail"},
+      {kClientEntryFilters, Value(), "filters: fail"},
+      {kClientEntryFilters, Array{1}, "filters: fail"},
+      {kClientEntrySamplingThreshold, 0.6, "sampling: pass"},
+      {kClientEntrySamplingThreshold, 0.5, "override sampling: hold"},
+      {kClientEntrySamplingThreshold, Value(), "sampling: fail"},
+      {kClientEntryPerCountrySamplingThresholds, perCountry, "override sampling: hold"},
+      {kClientEntryPerCountrySamplingThresholds, elsewhere, "sampling: pass"},
+      {kClientEntryEventThreshold, 5, "sampling: pass"},
+      {kClientEntryExtrasOnInternal, 1, "sampling: pass"},
+      {kClientEntryCustomClientId, 1, "sampling: pass"},
+      {kClientEntryPostURL, Value(), "sampling: pass"},
+      {kClientEntryRealtimePostURL, Value(), "sampling: pass"},
+      {kClientEntryEventWhitelist, Array{1, 2}, "sampling: pass"},
+      {kClientEntryEventBlacklist, Array{1, 2}, "sampling: pass"},
+      {kClientEntryIncludeSessionID, 1, "sampling: pass"},
+      {kClientEntryUseWiFiOnly, 1, "sampling: pass"},
+  };
+}
+
+TEST_F(StorebagExplainTest, saysOfEachGateWhatARealBackendDecides) {
+  log().allowErrors();
+  const Dictionary open = _client;
+  for (const GateCase& gate : gateCases()) {
+    SCOPED_TRACE(std::string(gate.key.view()) + " " + description(gate.value));
+    _client = open;
+    _client.set(gate.key, gate.value);
+    const Dictionary explained = explainBackend(0.5);
+    EXPECT_EQ(because(explained), gate.because);
+    expectTheSame(explained, 0.5);
+  }
+}
+
+TEST_F(StorebagExplainTest, decidesSamplingAsARealBackendDoes) {
+  _client.set(kClientEntrySamplingThreshold, 0.5);
+  for (const Value& override : {Value(), Value(0.4), Value(0.7)}) {
+    _client.set(kClientEntryOverrideSampling, override);
+    for (const double factor : {0.0, 0.3999, 0.4, 0.4999, 0.5, 0.6999, 0.7, 0.9999}) {
+      SCOPED_TRACE(fmt::format("{} {}", override, factor));
+      expectTheSame(explainBackend(factor), factor);
+    }
+  }
+}
+
+TEST_F(StorebagExplainTest, decidesConsentAsARealBackendDoes) {
+  for (const Value& override : {Value(), Value(0), Value(1), Value(2), Value("1"), Value(true)}) {
+    _client.set(kClientEntryOverrideDNU, override);
+    for (const bool isGiven : {true, false}) {
+      SCOPED_TRACE(fmt::format("{} {}", override, isGiven));
+      process().consent().set(isGiven);
+      expectTheSame(explainBackend(0, {"--consent", isGiven ? "on" : "off"}), 0);
+    }
+  }
+}
+
+TEST_F(StorebagExplainTest, decidesForASessionAndADeviceThatLackSomething) {
+  _userInfo = Value();
+  const Dictionary undecided = explainBackend(0, {"--client-name", "", "--service-name", ""});
+  EXPECT_EQ(because(undecided), "user info: fail");
+  EXPECT_EQ(text(undecided, "state"), "unknown");
+  expectTheSame(undecided, 0);
+  _requiresUserInfo = false;
+  const Dictionary always =
+      explainBackend(0, {"--client-name", "", "--service-name", "", "--require-user-info", "off"});
+  EXPECT_EQ(because(always), "user info required: set");
+  EXPECT_THAT(text(always, "events"), HasSubstr("no connection"));
+  expectTheSame(always, 0);
+}
+
+TEST_F(StorebagExplainTest, aDeviceWithoutACountryPassesAnyListAndOneWithoutHardwareNoBlacklist) {
+  process().locale().setCountryCode(std::nullopt);
+  expectTheSame(explainBackend(0, {"--country", ""}), 0);
+  _hardwareType = std::nullopt;
+  _client.set(kClientEntryDeviceBlacklist, Array{"Other"});
+  const Dictionary refused = explainBackend(0, {"--country", "", "--hardware", ""});
+  EXPECT_EQ(because(refused), "device blacklist: fail");
+  expectTheSame(refused, 0);
+}
+
+TEST_F(StorebagExplainTest, takesURLsOfTheUsersSettings) {
+  givenDefault(kDefaultsHTTPSPostURL, "https://other.example/events");
+  _scratch.write("settings", R"({"httpsPostURL": "https://other.example/events"})");
+  const Dictionary explained = explainBackend(0, {"--defaults", "@settings"});
+  EXPECT_EQ(text(explained, "postURL"), "https://other.example/events");
+  EXPECT_EQ(text(explained, "realtimePostURL"), kRealtimeURL);
+  expectTheSame(explained, 0);
+}
+
+TEST_F(StorebagExplainTest, saysWhyEarlierEntriesAreSkipped) {
+  Dictionary other = _client;
+  other.set(kClientEntryClient, "other");
+  Dictionary mail = _client;
+  mail.set(kClientEntryService, "mail");
+  Dictionary later = _client;
+  later.set(kClientEntryEnabledSince, "9.0");
+  _clients = Array{1, other, mail, later, _client};
+  const Dictionary explained = explainBackend();
+  std::vector<std::string> skipped;
+  for (const Value& step : *explained["gates"].array()) {
+    const Dictionary& fields = *step.dictionary();
+    if (text(fields, "outcome") != "skip") continue;
+    skipped.push_back(fmt::format("{} {}: {}", fields["entry"], fields["gate"], fields["text"]));
+  }
+  EXPECT_THAT(skipped, ElementsAre("0 entry: no dictionary", "1 client name: player is none of other",
+                                   "2 service name: StreamMediaPlayer has none in it of mail",
+                                   "3 enabled since: framework 8.1 is below 9.0"));
+  EXPECT_EQ((*explained["because"].dictionary())["entry"], Value(4));
+  expectTheSame(explained, 0);
+}
+
+TEST_F(StorebagExplainTest, bearsAnyKindOfValueUnderAnyKeyAsARealBackendDoes) {
+  log().allowErrors();
+  const Dictionary open = _client;
+  const std::vector<Value> kinds = {true,
+                                    -1,
+                                    1e300,
+                                    "",
+                                    "text",
+                                    Data(std::string("\x00\xff", 2)),
+                                    Date(),
+                                    Array{Value(Array{1})},
+                                    Dictionary{{kFilterKey, 1}}};
+  for (const Key& key : {kClientEntryClient,
+                         kClientEntryService,
+                         kClientEntryExpedite,
+                         kClientEntryEnabledSince,
+                         kClientEntryOverrideDNU,
+                         kClientEntryLocaleWhitelist,
+                         kClientEntryDeviceWhitelist,
+                         kClientEntryDeviceBlacklist,
+                         kClientEntryFilters,
+                         kClientEntrySamplingThreshold,
+                         kClientEntryPerCountrySamplingThresholds,
+                         kClientEntryOverrideSampling,
+                         kClientEntryCustomClientId,
+                         kClientEntryEventThreshold,
+                         kClientEntryExtrasOnInternal,
+                         kClientEntryPostURL,
+                         kClientEntryRealtimePostURL,
+                         kClientEntryEventWhitelist,
+                         kClientEntryEventBlacklist,
+                         kClientEntryIncludeSessionID,
+                         kClientEntryUseWiFiOnly}) {
+    for (const Value& value : kinds) {
+      SCOPED_TRACE(std::string(key.view()) + " " + description(value));
+      _client = open;
+      _client.set(key, value);
+      expectTheSame(explainBackend(0.5), 0.5);
+      givenBag(bag());
+      EXPECT_EQ(run({"explain", "@bag"}), 0) << errors();
+    }
+  }
+}
+
+TEST_F(StorebagExplainTest, saysWhatBecomesOfEvents) {
+  EXPECT_EQ(text(explainBackend(), "events"), "batched, and sent with a flush; real-time ones at once");
+  EXPECT_EQ(text(explainBackend(0, {"--batch-events", "off"}), "events"), "sent at once, one by one");
+  _client.set(kClientEntryExpedite, 1);
+  EXPECT_EQ(text(explainBackend(), "events"), "sent at once, one by one");
+  _client.set(kClientEntrySamplingThreshold, 0.0);
+  EXPECT_THAT(text(explainBackend(), "events"), HasSubstr("until a promoting message comes"));
+  _client.set(kClientEntryOverrideSampling, 0.0);
+  EXPECT_EQ(text(explainBackend(), "events"), "dropped");
+  _client.set(kClientEntrySamplingThreshold, 1.0);
+  _client.set(kClientEntryPostURL, Value());
+  EXPECT_THAT(text(explainBackend(), "events"), HasSubstr("no address"));
+}
+
+TEST_F(StorebagExplainTest, saysWhichFieldsFiltersTouch) {
+  _client.set(kClientEntryFilters, Array{Value(Dictionary{{kFilterKey, "account"}, {kFilterAction, "sha256"}}),
+                                         Value(Dictionary{{kFilterKey, "name"}, {kFilterAction, "shred"}})});
+  const Dictionary explained = explainBackend();
+  EXPECT_EQ(explained["filters"].array()->size(), 2u);
+  run({"explain", "@bag", "--country", "US"});
+  EXPECT_THAT(output(), HasSubstr("2: account sha256, name none\n"));
+}
+
+TEST_F(StorebagExplainTest, saysWhichEnvironmentsThereAreWhenTheOneAskedForIsMissing) {
+  const Value section = bag()[kEnvironmentRelease];
+  givenBag({{kStorebagVersion, "7"}, {kEnvironmentRelease, section}, {kEnvironmentInternal, section}});
+  const Dictionary missing = explain(0, {"--environment", "development"});
+  EXPECT_FALSE(missing.contains("section"));
+  EXPECT_THAT(texts(missing["sections"]), ElementsAre("corvex_internal", "release"));
+  EXPECT_TRUE(missing["backends"].array()->empty());
+  ASSERT_EQ(run({"explain", "@bag", "--environment", "development"}), 0);
+  EXPECT_THAT(output(), HasSubstr("development, which the bag has no section for (it has: corvex_internal, release)"));
+  EXPECT_EQ(text(explain(0, {"--environment", "seed"}), "section"), "release");
+  ASSERT_EQ(run({"explain", "@bag", "--environment", "seed"}), 0);
+  EXPECT_THAT(output(), HasSubstr("release is taken instead"));
+}
+
+TEST_F(StorebagExplainTest, takesTheEnvironmentThatTheBuildOrTheSettingsChoose) {
+  const Value section = bag()[kEnvironmentRelease];
+  givenBag({{kEnvironmentRelease, section}, {kEnvironmentInternal, section}, {kEnvironmentDevelopment, section}});
+  const auto sectionWith = [this](const Arguments& options) {
+    Arguments arguments{"explain", "@bag", "--json"};
+    arguments.insert(arguments.end(), options.begin(), options.end());
+    EXPECT_EQ(run(arguments), 0) << errors();
+    return text(*json::parse(output()).value().dictionary(), "section");
+  };
+  _scratch.write("settings", R"({"environmentType": 1})");
+  EXPECT_EQ(sectionWith({}), "release");
+  EXPECT_EQ(sectionWith({"--internal"}), "corvex_internal");
+  EXPECT_EQ(sectionWith({"--defaults", "@settings"}), "development");
+  EXPECT_EQ(sectionWith({"--defaults", "@settings", "--environment", "release"}), "release");
+}
+
+TEST_F(StorebagExplainTest, expandsMacrosAndNamesThoseThatAreUnusedOrUndefined) {
+  _client.set(kClientEntryLocaleWhitelist, "==COUNTRIES");
+  _client.set(kClientEntryDeviceBlacklist, "==NOWHERE");
+  Dictionary withMacros = bag();
+  Dictionary macros;
+  macros.set("==COUNTRIES", "US,DE");
+  macros.set("==SPARE", 1);
+  withMacros.set(kStorebagSharedValues, macros);
+  givenBag(withMacros);
+  const Dictionary explained = explain();
+  EXPECT_EQ(text(only(explained), "state"), "enabled");
+  EXPECT_THAT(texts(explained["usedMacros"]), ElementsAre("==COUNTRIES"));
+  EXPECT_THAT(texts(explained["undefinedMacros"]), ElementsAre("==NOWHERE"));
+  run({"explain", "@bag"});
+  EXPECT_THAT(output(), HasSubstr("==COUNTRIES = [US, DE]\n"));
+  EXPECT_THAT(output(), HasSubstr("==SPARE = 1 (not used here)\n"));
+  EXPECT_THAT(output(), HasSubstr("==NOWHERE is not defined and stays as it is\n"));
+}
+
+TEST_F(StorebagExplainTest, saysOfNamesThatMakeNoBackendWhy) {
+  Dictionary section;
+  section.set(kTelvaneBackendVDR.view().data(), Dictionary{{kProfileActive, true}});
+  section.set("nonsense", profile());
+  section.set("mysplunk", Dictionary{{kProfileClients, Array()}});
+  section.set(kTelvaneBackendQRS.view().data(), profile());
+  givenBag({{kEnvironmentRelease, section}, {kStorebagReleaseTimeout, 60}});
+  const Dictionary explained = explain();
+  const Array& backends = *explained["backends"].array();
+  ASSERT_EQ(backends.size(), 4u) << "release_timeout names no backend";
+  const auto reason = [&backends](size_t index) {
+    const Dictionary& backend = *backends[index].dictionary();
+    return std::string((*backend["because"].dictionary())["text"].text());
+  };
+  EXPECT_EQ(reason(0), "this build has no backend of this kind yet");
+  EXPECT_EQ(reason(1), "no kind of backend has this name");
+  EXPECT_EQ(reason(2), "its profile has no list \"clients\" with an entry");
+  EXPECT_EQ(text(*backends[3].dictionary(), "state"), "enabled");
+  run({"explain", "@bag", "--product-family", ""});
+  EXPECT_THAT(output(), HasSubstr("qrs: not made\n  because  a device without product family gets none\n"));
+}
+
+TEST_F(StorebagExplainTest, readsPropertyListsJSONAndEnvelopes) {
+  const auto bagLine = [this](std::string_view bytes) {
+    _scratch.write("bag", bytes);
+    EXPECT_EQ(run({"explain", "@bag"}), 0) << errors();
+    EXPECT_THAT(output(), HasSubstr("\nsplunk: enabled\n"));
+    return output().substr(0, output().find('\n'));
+  };
+  EXPECT_THAT(bagLine(propertylist::serialize(bag(), propertylist::Format::Binary).value().view()),
+              HasSubstr("version 7, not signed"));
+  EXPECT_THAT(bagLine(json::serialize(bag()).value()), HasSubstr("version 7, not signed"));
+  EXPECT_THAT(bagLine(StorebagBuilder::envelopeOfAStranger(bag())),
+              HasSubstr("version 7, in an envelope; its signature was not checked"));
+}
+
+TEST_F(StorebagExplainTest, namesWhatItAssumed) {
+  givenBag(bag());
+  ASSERT_EQ(run({"explain", "@bag", "--country", "DE", "--sampling-factor", "0.25"}), 0);
+  EXPECT_THAT(output(), HasSubstr("\nassumed      --client-type 5, --client-name example, --service-name ''"));
+  EXPECT_THAT(output(), HasSubstr("--consent on"));
+  EXPECT_THAT(output(), Not(HasSubstr("--country DE")));
+  EXPECT_THAT(output(), Not(HasSubstr("--sampling-factor 0.25")));
+  EXPECT_THAT(output(), HasSubstr("country DE"));
+  EXPECT_THAT(output(), HasSubstr("sampling factor 0.25"));
+  ASSERT_EQ(run({"explain", "@bag", "--service-name", "mail"}), 0);
+  EXPECT_THAT(output(), HasSubstr("client none, service mail"));
+}
+
+TEST_F(StorebagExplainTest, aSamplingFactorIsOneThatADeviceDraws) {
+  givenBag(bag());
+  const auto factorOf = [this](const std::string& asked) {
+    EXPECT_EQ(run({"explain", "@bag", "--json", "--sampling-factor", asked}), 0) << errors();
+    return (*json::parse(output()).value().dictionary()->operator[]("case").dictionary())["samplingFactor"].realValue();
+  };
+  EXPECT_EQ(factorOf("1"), 0.9999);
+  EXPECT_EQ(factorOf("0.29"), 0.29);
+  EXPECT_EQ(factorOf("0.12345"), 0.1234);
+  EXPECT_EQ(factorOf("0"), 0);
+}
+
+TEST_F(StorebagExplainTest, showsTheDaemonsLogLinesWhenAsked) {
+  givenBag(bag());
+  run({"explain", "@bag"});
+  EXPECT_THAT(output(), Not(HasSubstr("  log ")));
+  run({"explain", "@bag", "--log", "--country", "FR"});
+  EXPECT_THAT(output(), HasSubstr("  log      userDefaultsEnvironment: Environment type 4\n"));
+  EXPECT_THAT(output(),
+              HasSubstr("  log      HTTPSPostBackend(updateBackendState): (FR) isn't in country code list (\\n"));
+}
+
+TEST_F(StorebagExplainTest, printsTheWholeStoryStepByStep) {
+  Dictionary other = _client;
+  other.set(kClientEntryClient, "other");
+  _clients = Array{other, _client};
+  givenBag(bag());
+  ASSERT_EQ(run({"explain", "@bag", "--client-name", "player", "--country", "FR"}), 0);
+  EXPECT_THAT(output().substr(output().find("\nsplunk")),
+              "\nsplunk: disabled\n"
+              "  because  country: FR is not in [US, DE]\n"
+              "  events   dropped\n"
+              "  pass     client list                     2 in the list\n"
+              "  default  clients[1] expedite             the first entry with the session's names has none, so events "
+              "are sent one by one\n"
+              "  set      user info required              yes, the entry that is for the session decides\n"
+              "  pass     user info                       the session has it\n"
+              "  skip     clients[0] client name          player is none of other\n"
+              "  pass     clients[1] matching entry       this entry decides alone\n"
+              "  pass     clients[1] consent              the user consents\n"
+              "  fail     clients[1] country              FR is not in [US, DE]\n");
+}
+
+TEST_F(StorebagExplainTest, failsWithOneLineWhenThereIsNothingToExplain) {
+  const auto expectFailure = [this](const Arguments& arguments, const std::string& part) {
+    EXPECT_EQ(run(arguments), 1);
+    EXPECT_THAT(errors(), StartsWith("telvane-storebag: "));
+    EXPECT_THAT(errors(), HasSubstr(part));
+    EXPECT_EQ(errors().find('\n'), errors().size() - 1) << errors();
+    EXPECT_EQ(output(), "");
+  };
+  expectFailure({"explain", "@nothing"}, "nothing");
+  _scratch.write("bag", "garbage");
+  expectFailure({"explain", "@bag"}, "cannot be read");
+  _scratch.write("bag", "[1]");
+  expectFailure({"explain", "@bag"}, "no dictionary");
+  _scratch.write("bag", "<plist><dict><key>bag</key><string>AA==</string></dict></plist>");
+  expectFailure({"explain", "@bag"}, "signature");
+  givenBag(bag());
+  _scratch.write("settings", "garbage");
+  expectFailure({"explain", "@bag", "--defaults", "@settings"}, "holds no settings");
+}
+
+TEST_F(StorebagExplainTest, wrongUsageIsTwo) {
+  givenBag(bag());
+  const std::vector<Arguments> wrong = {{"explain"},
+                                        {"explain", "@bag", "@bag"},
+                                        {"explain", "@bag", "--nonsense"},
+                                        {"explain", "@bag", "--sampling-factor", "1.1"},
+                                        {"explain", "@bag", "--sampling-factor", "-0.1"},
+                                        {"explain", "@bag", "--sampling-factor", "nan"},
+                                        {"explain", "@bag", "--sampling-factor", "half"},
+                                        {"explain", "@bag", "--consent", "maybe"},
+                                        {"explain", "@bag", "--client-type", "4"},
+                                        {"explain", "@bag", "--client-type", "31"},
+                                        {"explain", "@bag", "--environment", "prod"},
+                                        {"explain", "@bag", "--framework-version", "new"}};
+  for (const Arguments& arguments : wrong) {
+    EXPECT_EQ(run(arguments), 2) << ::testing::PrintToString(arguments);
+    EXPECT_THAT(errors(), HasSubstr("--help"));
+    EXPECT_EQ(output(), "");
+  }
+}
+
+TEST_F(StorebagExplainTest, hasHelpThatNamesWhatIsAssumed) {
+  EXPECT_EQ(run({"explain", "--help"}), 0);
+  for (const char* option : {"--client-type", "--client-name", "--service-name", "--country", "--product-family",
+                             "--hardware", "--framework-version", "--consent", "--sampling-factor", "--environment"}) {
+    EXPECT_THAT(output(), HasSubstr(option));
+  }
+  EXPECT_THAT(output(), HasSubstr("=US"));
+  EXPECT_THAT(output(), HasSubstr("signature is not checked"));
+}
+
+}  // namespace
+}  // namespace telvane::testing

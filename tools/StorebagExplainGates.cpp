@@ -1,0 +1,325 @@
+#include "tools/StorebagExplainGates.h"
+
+#include <algorithm>
+#include <array>
+
+#include "foundation/Format.h"
+#include "interfaces/BackendKind.h"
+#include "interfaces/StorebagKeys.h"
+#include "platform/JSON.h"
+
+namespace telvane {
+namespace {
+
+struct GateWords {
+  Gate gate;
+  std::string_view name;
+  std::string_view key;
+};
+
+constexpr std::array kGateWords = {
+    GateWords{Gate::ClientList, "client list", kProfileClients.view()},
+    GateWords{Gate::Expedite, "expedite", kClientEntryExpedite.view()},
+    GateWords{Gate::UserInfoRequired, "user info required", {}},
+    GateWords{Gate::UserInfo, "user info", {}},
+    GateWords{Gate::EntryKind, "entry", {}},
+    GateWords{Gate::ClientName, "client name", kClientEntryClient.view()},
+    GateWords{Gate::ServiceName, "service name", kClientEntryService.view()},
+    GateWords{Gate::EnabledSince, "enabled since", kClientEntryEnabledSince.view()},
+    GateWords{Gate::MatchingEntry, "matching entry", {}},
+    GateWords{Gate::Consent, "consent", kClientEntryOverrideDNU.view()},
+    GateWords{Gate::Country, "country", kClientEntryLocaleWhitelist.view()},
+    GateWords{Gate::DeviceWhitelist, "device whitelist", kClientEntryDeviceWhitelist.view()},
+    GateWords{Gate::DeviceBlacklist, "device blacklist", kClientEntryDeviceBlacklist.view()},
+    GateWords{Gate::Filters, "filters", kClientEntryFilters.view()},
+    GateWords{Gate::SamplingThreshold, "sampling threshold", kClientEntrySamplingThreshold.view()},
+    GateWords{Gate::PerCountryThreshold, "country threshold", kClientEntryPerCountrySamplingThresholds.view()},
+    GateWords{Gate::Sampling, "sampling", {}},
+    GateWords{Gate::OverrideSampling, "override sampling", kClientEntryOverrideSampling.view()},
+    GateWords{Gate::EventThreshold, "event threshold", kClientEntryEventThreshold.view()},
+    GateWords{Gate::ExtrasOnInternal, "extras on internal", kClientEntryExtrasOnInternal.view()},
+    GateWords{Gate::CustomClientIdentifier, "custom client id", kClientEntryCustomClientId.view()},
+    GateWords{Gate::PostURL, "post url", kClientEntryPostURL.view()},
+    GateWords{Gate::RealtimePostURL, "realtime post url", kClientEntryRealtimePostURL.view()},
+    GateWords{Gate::EventWhitelist, "event whitelist", kClientEntryEventWhitelist.view()},
+    GateWords{Gate::EventBlacklist, "event blacklist", kClientEntryEventBlacklist.view()},
+    GateWords{Gate::IncludeSessionID, "include session id", kClientEntryIncludeSessionID.view()},
+    GateWords{Gate::UseWiFiOnly, "use wifi only", kClientEntryUseWiFiOnly.view()},
+};
+
+static_assert(kGateWords.size() == static_cast<size_t>(Gate::UseWiFiOnly) + 1, "one row for each gate, in their order");
+
+const GateWords& wordsOf(Gate gate) noexcept { return kGateWords[static_cast<size_t>(gate)]; }
+
+bool isPassed(const GateStep& step) noexcept { return step.answer.outcome == GateOutcome::Passed; }
+
+bool isTaken(const GateStep& step) noexcept { return step.answer.outcome == GateOutcome::Taken; }
+
+bool isEmptyList(const Value& list) noexcept { return !list.isArray() || list.array()->empty(); }
+
+std::string_view batchingWords(bool batchesEvents) noexcept {
+  return batchesEvents ? "are batched" : "are sent one by one";
+}
+
+std::string listOf(const Array& array) {
+  std::string list;
+  for (const Value& element : array) list += (list.empty() ? "" : ", ") + shortText(element);
+  return "[" + list + "]";
+}
+
+std::string expediteSentence(const GateStep& step) {
+  const std::string_view words = batchingWords(step.answer.tested.booleanValue());
+  if (isTaken(step)) return fmt::format("{}, so events {}", shortText(step.answer.against), words);
+  if (!step.entry.has_value()) return fmt::format("no entry has the session's names, so events {}", words);
+  return fmt::format("the first entry with the session's names has none, so events {}", words);
+}
+
+std::string nameSentence(const GateStep& step, std::string_view yes, std::string_view no) {
+  const auto& [gate, outcome, tested, against] = step.answer;
+  if (isPassed(step) && !against.isString()) return "the entry is for all";
+  if (!tested.isPresent()) return fmt::format("the session has none, the entry wants {}", shortText(against));
+  return fmt::format("{} {} {}", shortText(tested), isPassed(step) ? yes : no, shortText(against));
+}
+
+std::string enabledSinceSentence(const GateStep& step) {
+  if (!step.answer.against.isString()) return "any framework version";
+  return fmt::format("framework {} is {} {}", step.answer.tested.text(), isPassed(step) ? "not below" : "below",
+                     step.answer.against.text());
+}
+
+std::string consentSentence(const GateStep& step) {
+  const auto& [gate, outcome, tested, against] = step.answer;
+  if (tested.booleanValue()) return "the user consents";
+  if (isPassed(step)) return fmt::format("the user does not consent, {} overrides that", shortText(against));
+  return fmt::format("the user does not consent, and nothing overrides that ({})", shortText(against));
+}
+
+std::string countrySentence(const GateStep& step) {
+  const auto& [gate, outcome, tested, against] = step.answer;
+  if (isEmptyList(against)) return "the list names no country, so nobody reports";
+  if (!tested.isPresent()) return "the device has no country, which any list lets through";
+  return fmt::format("{} is {}in {}", shortText(tested), isPassed(step) ? "" : "not ", shortText(against));
+}
+
+std::string deviceSentence(const GateStep& step, bool isRefusedWhenFound) {
+  const auto& [gate, outcome, tested, against] = step.answer;
+  if (isEmptyList(against)) return "no list, every device passes";
+  if (!tested.isPresent()) return fmt::format("the device does not tell, which {} refuses", shortText(against));
+  const bool isFound = isPassed(step) != isRefusedWhenFound;
+  return fmt::format("{} has {} of {} in it", shortText(tested), isFound ? "one" : "none", shortText(against));
+}
+
+std::string filtersSentence(const GateStep& step) {
+  if (!isPassed(step)) {
+    return step.answer.against.isArray() ? "a filter is no dictionary" : "no list; an empty one lets every field leave";
+  }
+  const Array* filters = step.answer.tested.array();
+  if (filters == nullptr || filters->empty()) return "none, every field leaves";
+  std::string list;
+  for (const Value& filter : *filters) {
+    const Dictionary& fields = *filter.dictionary();
+    list += fmt::format("{}{} {}", list.empty() ? "" : ", ", fields[kFilterKey].text(), fields[kFilterAction].text());
+  }
+  return fmt::format("{}: {}", filters->size(), list);
+}
+
+std::string countryThresholdSentence(const GateStep& step) {
+  if (isTaken(step)) return fmt::format("{} in its place for this country", shortText(step.answer.tested));
+  return step.answer.against.isPresent() ? "no item lists the country" : "none";
+}
+
+std::string samplingSentence(const GateStep& step) {
+  const auto& [gate, outcome, tested, against] = step.answer;
+  if (!against.isPresent()) return "without a threshold nobody reports";
+  return fmt::format("factor {} is {}below {}", tested.realValue(), isPassed(step) ? "" : "not ", shortText(against));
+}
+
+std::string overrideSamplingSentence(const GateStep& step) {
+  const auto& [gate, outcome, tested, against] = step.answer;
+  if (!against.isPresent()) {
+    return fmt::format("factor {} is not below the threshold, and no second one disables the device",
+                       tested.realValue());
+  }
+  return fmt::format("factor {} is {}below {}, so the device is {}", tested.realValue(), isPassed(step) ? "" : "not ",
+                     shortText(against), isPassed(step) ? "sampled out" : "disabled");
+}
+
+std::string eventThresholdSentence(const GateStep& step) {
+  return fmt::format("{}, so at most {} events of a category wait", step.answer.tested.integerValue(),
+                     step.answer.tested.integerValue() + 1);
+}
+
+std::string urlSentence(const GateStep& step, std::string_view whenNotGiven) {
+  const std::string url = shortText(step.answer.tested);
+  if (step.answer.outcome == GateOutcome::Kept) return url + ", of the user defaults";
+  return isTaken(step) ? url : fmt::format("{}, {}", url, whenNotGiven);
+}
+
+std::string categoriesSentence(const GateStep& step, std::string_view whenNotGiven) {
+  return step.answer.tested.isPresent() ? shortText(step.answer.tested) : std::string(whenNotGiven);
+}
+
+std::string yesOrNo(const Value& value) { return value.booleanValue() ? "yes" : "no"; }
+
+// Steps about what the matched entry takes over, none of which can stop a report.
+std::string settingSentence(const GateStep& step) {
+  switch (step.answer.gate) {
+    case Gate::EventThreshold:
+      return eventThresholdSentence(step);
+    case Gate::ExtrasOnInternal:
+      return shortText(step.answer.tested);
+    case Gate::CustomClientIdentifier:
+      return isTaken(step) ? "an identifier of this client and service is sent" : "the device's identifier is sent";
+    case Gate::PostURL:
+      return urlSentence(step, "so nothing can be posted");
+    case Gate::RealtimePostURL:
+      return urlSentence(step, "as the post url");
+    case Gate::EventWhitelist:
+      return categoriesSentence(step, "every category");
+    case Gate::EventBlacklist:
+      return categoriesSentence(step, "no category");
+    default:
+      return yesOrNo(step.answer.tested);
+  }
+}
+
+// Steps before the entry that decides is known.
+std::string searchSentence(const GateStep& step) {
+  switch (step.answer.gate) {
+    case Gate::ClientList:
+      return isPassed(step) ? fmt::format("{} in the list", step.answer.tested.integerValue()) : "the list is empty";
+    case Gate::Expedite:
+      return expediteSentence(step);
+    case Gate::UserInfoRequired:
+      return step.answer.tested.booleanValue() ? "yes, the entry that is for the session decides"
+                                               : "no, so the backend is always enabled";
+    case Gate::UserInfo:
+      return isPassed(step) ? "the session has it" : "the session has none yet, nothing can be decided";
+    case Gate::EntryKind:
+      return isPassed(step) ? "a dictionary" : "no dictionary";
+    case Gate::ClientName:
+      return nameSentence(step, "is one of", "is none of");
+    case Gate::ServiceName:
+      return nameSentence(step, "has one in it of", "has none in it of");
+    case Gate::EnabledSince:
+      return enabledSinceSentence(step);
+    default:
+      return isPassed(step) ? "this entry decides alone" : "no entry is for this session";
+  }
+}
+
+}  // namespace
+
+std::string_view gateName(Gate gate) noexcept { return wordsOf(gate).name; }
+
+std::string_view gateKey(Gate gate) noexcept { return wordsOf(gate).key; }
+
+std::string_view outcomeWord(const GateStep& step) noexcept {
+  const Gate gate = step.answer.gate;
+  switch (step.answer.outcome) {
+    case GateOutcome::Passed:
+      return gate == Gate::OverrideSampling ? "hold" : "pass";
+    case GateOutcome::Refused:
+      return gate >= Gate::EntryKind && gate <= Gate::EnabledSince ? "skip" : "fail";
+    case GateOutcome::Taken:
+      return "set";
+    case GateOutcome::NotGiven:
+      return "default";
+    case GateOutcome::Kept:
+      return "kept";
+  }
+  return {};
+}
+
+std::string gateSentence(const GateStep& step) {
+  switch (step.answer.gate) {
+    case Gate::Consent:
+      return consentSentence(step);
+    case Gate::Country:
+      return countrySentence(step);
+    case Gate::DeviceWhitelist:
+      return deviceSentence(step, false);
+    case Gate::DeviceBlacklist:
+      return deviceSentence(step, true);
+    case Gate::Filters:
+      return filtersSentence(step);
+    case Gate::SamplingThreshold:
+      return shortText(step.answer.tested);
+    case Gate::PerCountryThreshold:
+      return countryThresholdSentence(step);
+    case Gate::Sampling:
+      return samplingSentence(step);
+    case Gate::OverrideSampling:
+      return overrideSamplingSentence(step);
+    default:
+      return step.answer.gate <= Gate::MatchingEntry ? searchSentence(step) : settingSentence(step);
+  }
+}
+
+// Every step but the settings can decide, and the last of those that were taken did.
+const GateStep* decidingStep(const BackendExplanation& backend) noexcept {
+  const auto decides = [](const GateStep& step) {
+    return step.answer.outcome == GateOutcome::Passed || step.answer.outcome == GateOutcome::Refused ||
+           step.answer.gate == Gate::UserInfoRequired;
+  };
+  const auto last = std::find_if(backend.steps.rbegin(), backend.steps.rend(), decides);
+  return last != backend.steps.rend() ? &*last : nullptr;
+}
+
+std::string_view stateName(uint32_t state) noexcept {
+  switch (state) {
+    case TelvaneBackendStateDisabled:
+      return "disabled";
+    case TelvaneBackendStateEnabled:
+      return "enabled";
+    case TelvaneBackendStateSampledOut:
+      return "sampled out";
+    default:
+      return "unknown";
+  }
+}
+
+std::string eventsSentence(const BackendExplanation& backend, const StorebagExplainCase& situation) {
+  switch (backend.state) {
+    case TelvaneBackendStateDisabled:
+      return "dropped";
+    case TelvaneBackendStateSampledOut:
+      return "batched until a promoting message comes; a flush before that discards them";
+    case TelvaneBackendStateEnabled:
+      break;
+    default:
+      return "batched until the session has user info; a flush before that discards them";
+  }
+  if (situation.clientName.empty() && situation.serviceName.empty()) {
+    return "lost: a session without client name and service name has no connection to post through";
+  }
+  if (!settingAfter(backend, Gate::PostURL).isPresent()) return "lost: there is no address to post to";
+  return backend.batchesEvents ? "batched, and sent with a flush; real-time ones at once" : "sent at once, one by one";
+}
+
+std::string notMadeSentence(const BackendExplanation& backend, const StorebagExplainCase& situation) {
+  const BackendKind kind = backendKindForName(backend.name);
+  if (kind == BackendKind::Unknown) return "no kind of backend has this name";
+  if (!isBackendKindBuilt(kind)) return "this build has no backend of this kind yet";
+  if (situation.productFamily.empty()) return "a device without product family gets none";
+  return "its profile has no list \"clients\" with an entry";
+}
+
+const Value& settingAfter(const BackendExplanation& backend, Gate gate) noexcept {
+  const auto last = std::find_if(backend.steps.rbegin(), backend.steps.rend(),
+                                 [gate](const GateStep& step) { return step.answer.gate == gate; });
+  return last != backend.steps.rend() ? last->answer.tested : Value::none();
+}
+
+std::string shortText(const Value& value) {
+  if (!value.isPresent()) return "none";
+  if (const Array* array = value.array()) return listOf(*array);
+  if (value.isString()) return std::string(value.text());
+  const Result<std::string> text = json::serialize(value);
+  if (text.has_value()) return *text;
+  std::string described = description(value);
+  std::replace(described.begin(), described.end(), '\n', ' ');
+  return described;
+}
+
+}  // namespace telvane

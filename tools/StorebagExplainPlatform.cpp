@@ -1,0 +1,169 @@
+#include "tools/StorebagExplainPlatform.h"
+
+#include <algorithm>
+#include <cmath>
+#include <cstring>
+
+#include "interfaces/DefaultsKeys.h"
+#include "interfaces/StorebagKeys.h"
+#include "platform/system/SystemPlatform.h"
+
+namespace telvane {
+namespace {
+
+constexpr uint32_t kSamplingSteps = 10000;
+// Stands for the identifiers that a device makes once and keeps.
+constexpr std::string_view kDevicesOwn = "(the device's own)";
+
+std::optional<String> textOrNone(const std::string& text) {
+  return text.empty() ? std::nullopt : std::optional(String(text));
+}
+
+// Draws what makes a backend's sampling factor the one that was asked for.
+class ChosenRandom final : public Random {
+ public:
+  explicit ChosenRandom(double samplingFactor)
+      : _draw(static_cast<uint32_t>(std::lround(samplingFactor * kSamplingSteps))) {}
+
+  // A number of 32 bits is cut down to its remainder; those below the number of steps may be drawn anew, so none is.
+  void fill(std::span<uint8_t> bytes) override {
+    std::fill(bytes.begin(), bytes.end(), uint8_t{0});
+    const uint32_t number = _draw + kSamplingSteps;
+    if (bytes.size() == sizeof number) std::memcpy(bytes.data(), &number, sizeof number);
+  }
+
+ private:
+  const uint32_t _draw;
+};
+
+class ChosenDefaults final : public UserDefaults {
+ public:
+  explicit ChosenDefaults(Dictionary settings) : _settings(std::move(settings)) {}
+
+  Value objectForKey(std::string_view suite, std::string_view key) const override {
+    return suite == kTelvaneDefaultsSuite.view() ? _settings[key] : Value();
+  }
+  Dictionary dictionaryRepresentation(std::string_view suite) const override {
+    return suite == kTelvaneDefaultsSuite.view() ? _settings : Dictionary();
+  }
+  Result<void> setObject(std::string_view, std::string_view, Value) override { return {}; }
+  Value objectForKeyOrStore(std::string_view suite, std::string_view key, UniqueFunction<Value()>) override {
+    Value stored = objectForKey(suite, key);
+    return stored.isPresent() ? stored : Value(kDevicesOwn);
+  }
+
+ private:
+  const Dictionary _settings;
+};
+
+class ChosenDevice final : public DeviceAnswers {
+ public:
+  explicit ChosenDevice(const StorebagExplainCase& situation) : _situation(situation) {}
+
+  std::optional<String> answer(const Key& key) const override {
+    if (key == kProductType.view()) return textOrNone(_situation.hardware);
+    if (key == kDeviceName.view()) return textOrNone(_situation.productFamily);
+    if (key == kReleaseType.view() && _situation.isInternal) return String("Internal");
+    return std::nullopt;
+  }
+
+ private:
+  const StorebagExplainCase& _situation;
+};
+
+class ChosenLocale final : public Locale {
+ public:
+  explicit ChosenLocale(const std::string& country) : _country(textOrNone(country)) {}
+
+  std::optional<String> countryCode() const override { return _country; }
+  std::chrono::seconds secondsFromGMT(Date) const override { return std::chrono::seconds(0); }
+
+ private:
+  const std::optional<String> _country;
+};
+
+class ChosenConsent final : public Consent {
+ public:
+  explicit ChosenConsent(bool isGiven) : _isGiven(isGiven) {}
+
+  bool isSubmissionAllowed() const override { return _isGiven; }
+
+ private:
+  const bool _isGiven;
+};
+
+class ChosenBundle final : public ClientBundle {
+ public:
+  explicit ChosenBundle(const std::string& version) : _version(textOrNone(version)) {}
+
+  std::optional<String> version() const override { return _version; }
+  std::optional<Data> publicKey() const override { return std::nullopt; }
+
+ private:
+  const std::optional<String> _version;
+};
+
+// The section keys stand in the order of their numbers, from 1.
+Dictionary settingsOf(const StorebagExplainCase& situation) {
+  constexpr std::string_view kEnvironments[] = {kEnvironmentDevelopment.view(), kEnvironmentInternal.view(),
+                                                kEnvironmentSeed.view(), kEnvironmentRelease.view()};
+  Dictionary settings = situation.defaults;
+  const auto* const found = std::find(std::begin(kEnvironments), std::end(kEnvironments), situation.environment);
+  if (found != std::end(kEnvironments)) settings.set(kDefaultsEnvironmentType, found - kEnvironments + 1);
+  return settings;
+}
+
+}  // namespace
+
+struct StorebagExplainPlatform::Parts {
+  explicit Parts(const StorebagExplainCase& chosen)
+      : situation(chosen),
+        system(log),
+        random(situation.samplingFactor),
+        defaults(settingsOf(situation)),
+        device(situation),
+        locale(situation.country),
+        consent(situation.hasConsent),
+        bundle(situation.frameworkVersion),
+        platform(withChosen(system.platform())) {}
+
+  Platform withChosen(const Platform& real) {
+    return {real.clock,
+            random,
+            real.dispatch,
+            log,
+            real.files,
+            defaults,
+            device,
+            locale,
+            consent,
+            bundle,
+            real.urlSessions,
+            real.transactions,
+            real.localService,
+            real.submittableLogs,
+            real.processMemory};
+  }
+
+  const StorebagExplainCase situation;
+  KeptLog log;
+  SystemPlatform system;
+  ChosenRandom random;
+  ChosenDefaults defaults;
+  ChosenDevice device;
+  ChosenLocale locale;
+  ChosenConsent consent;
+  ChosenBundle bundle;
+  Platform platform;
+};
+
+StorebagExplainPlatform::StorebagExplainPlatform(const StorebagExplainCase& situation)
+    : _parts(std::make_unique<Parts>(situation)) {}
+
+StorebagExplainPlatform::~StorebagExplainPlatform() = default;
+
+Platform& StorebagExplainPlatform::platform() noexcept { return _parts->platform; }
+
+KeptLog& StorebagExplainPlatform::log() noexcept { return _parts->log; }
+
+}  // namespace telvane
