@@ -161,7 +161,7 @@ TEST_F(BadInputTest, halfACharacterInAnEscapeIsRefusedWhereJSONIsRead) {
   EXPECT_EQ(events[0]["whole"], Value("\U0001f600"));
 }
 
-TEST_F(BadInputTest, ahundredThousandEntriesArrive) {
+TEST_F(BadInputTest, aHundredThousandEntriesArrive) {
   Dictionary payload;
   payload.reserve(kHuge);
   for (int i = 0; i < kHuge; ++i) payload.set(String("key" + std::to_string(i)), i);
@@ -217,17 +217,16 @@ TEST_F(BadInputTest, userInfoCannotCarryAnEventPastTheWhitelist) {
 }
 
 TEST_F(BadInputTest, sessionInfosOfAnyKindHarmNobodyElse) {
-  ClientScript script;
   for (const Value& odd : {Value("x"), Value(Array{1}), Value(kNaN), Value(Data::copyOf("x")), Value(Dictionary())}) {
     Dictionary info = sessionInfo();
     for (const Key& key : {kTelvaneSessionInfoClientVersion, kTelvaneSessionInfoSessionID,
                            kTelvaneSessionInfoBatchEvent, kTelvaneSessionInfoHierarchyToken}) {
       info.set(key, odd);
     }
-    ClientScript one;
-    one.open(info, userInfo()).configure().send(kGood, 1, Dictionary(), 1).flush();
+    ClientScript script;
+    script.open(info, userInfo()).configure().send(kGood, 1, Dictionary(), 1).flush();
     startDaemon();
-    EXPECT_THAT(run(one), HasSubstr("configured: [splunk]")) << instance().daemonLog();
+    EXPECT_THAT(run(script), HasSubstr("configured: [splunk]")) << instance().daemonLog();
     stopDaemon();
   }
   EXPECT_EQ(arrived(kGood).size(), 5u);

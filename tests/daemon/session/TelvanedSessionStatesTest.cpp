@@ -111,6 +111,20 @@ TEST_F(TelvanedSessionStatesTest, aChildTakesItsParentsStatesAndSampling) {
                       "0.00%"));
 }
 
+// The parent is one that is not asked for consent; what lies below it reports with it, since states come as they are.
+TEST_F(TelvanedSessionStatesTest, aChildFollowsItsParentInConsentToo) {
+  process.consent().set(false);
+  givenStorebag();
+  client = openSession(sessionInfoIn("b", 0, 3));
+  EXPECT_EQ(client->start()[0], Value(Array())) << "on its own it is disabled";
+  Dictionary unasked = sessionInfoIn("a", 0, 1);
+  unasked.set(kTelvaneSessionInfoRequireUserInfo, false);
+  log().expectError("setSessionInfo: Configure session: user info provided without requiring it");
+  const auto parent = startSession(unasked);
+  client = openSession(sessionInfoIn("a", 1, 2));
+  EXPECT_EQ(client->start()[0], Value(Array{"splunk"}));
+}
+
 TEST_F(TelvanedSessionStatesTest, aSampledOutChildStaysOut) {
   givenSection(StorebagBuilder::section("splunk"));
   const auto parent = startSession(sessionInfoIn("a", 0, 1));
