@@ -1,5 +1,7 @@
 #include "bench/BatchedEvents.h"
 
+#include <fmt/format.h>
+
 #include <cstdio>
 #include <string>
 
@@ -55,7 +57,7 @@ class Measuring {
 
   Run runCeiling();
   Run runRoad(int clientType, std::string_view logLevel);
-  uint64_t arrivedEvents() const { return _instance.arrivedEvents(); }
+  const RoadInstance& instance() const { return _instance; }
   // Why instructions are not counted; empty when they are.
   const std::string& refusal() const { return _refusal; }
 
@@ -172,7 +174,11 @@ void measureBatchedEvents(const RoadOptions& options, Report& report) {
   }
   addRounds(report.figures, rounds);
   addInstructions(report.figures, rounds, measuring.refusal());
-  report.arrivedEvents += measuring.arrivedEvents();
+  report.figures.addNote(fmt::format(
+      "Batched: {} events of 10 fields per run, {} rounds of runs in turn; ratios are taken within a round.",
+      options.events, options.rounds));
+  report.sentEvents += measuring.instance().expectedEvents();
+  report.arrivedEvents += measuring.instance().arrivedEvents();
 }
 
 }  // namespace telvane::bench

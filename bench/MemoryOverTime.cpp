@@ -61,6 +61,9 @@ void measureMemoryOverTime(const RoadOptions& options, Report& report) {
   addTrend(report.figures, "client", clientMemory);
   addWakeUps(report.figures, instance, options.idleSeconds);
   instance.endDaemon();
+  report.figures.addNote(fmt::format("Memory: resident, sampled every {} ms over a run of {} events.",
+                                     kInterval.count(), options.memoryEvents));
+  report.sentEvents += instance.expectedEvents();
   report.arrivedEvents += instance.arrivedEvents();
 }
 

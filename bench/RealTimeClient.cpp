@@ -153,7 +153,8 @@ void run(int argc, char** argv) {
   print("road", times.road);
   print("bare", times.bare);
   print("answered", times.answered);
-  std::printf("\"roadEvents\": %llu, \"connections\": %llu}\n", static_cast<unsigned long long>(kWarmUp + posts),
+  std::printf("\"sent\": %llu, \"arrived\": %zu, \"connections\": %llu}\n",
+              static_cast<unsigned long long>(kWarmUp + posts), warmUp.road.count() + times.road.count(),
               static_cast<unsigned long long>(server.acceptedConnections()));
 }
 

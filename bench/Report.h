@@ -1,5 +1,7 @@
 #pragma once
 
+#include <cstdint>
+
 #include "bench/FigureTable.h"
 
 namespace telvane::bench {
@@ -7,7 +9,8 @@ namespace telvane::bench {
 // What the parts of a measurement add to.
 struct Report {
   FigureTable figures;
-  // Counted where they arrived. A part that misses one does not get as far as adding.
+  // What was sent, and what was counted where it arrived.
+  uint64_t sentEvents = 0;
   uint64_t arrivedEvents = 0;
 };
 

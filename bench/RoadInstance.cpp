@@ -121,20 +121,16 @@ Dictionary RoadInstance::run(const std::string& program, const std::vector<std::
 
 void RoadInstance::waitForEvents(uint64_t count) {
   _expected += count;
-  uint64_t last = 0;
+  uint64_t last = _arrived;
   double lastChange = monotonicSeconds();
   for (;;) {
-    const uint64_t now = statistics()["events"].unsignedValue();
-    if (now > _expected) {
-      throw std::runtime_error("more events came than were sent: " + std::to_string(now) + " for " +
-                               std::to_string(_expected));
-    }
-    if (now == _expected) return;
-    if (now != last) lastChange = monotonicSeconds();
-    last = now;
-    if (monotonicSeconds() - lastChange > kStandstillSeconds) {
-      throw std::runtime_error("events were lost: " + std::to_string(now) + " of " + std::to_string(_expected));
-    }
+    _arrived = statistics()["events"].unsignedValue();
+    const std::string counts = std::to_string(_arrived) + " of " + std::to_string(_expected);
+    if (_arrived > _expected) throw std::runtime_error("more events came than were sent: " + counts);
+    if (_arrived == _expected) return;
+    if (_arrived != last) lastChange = monotonicSeconds();
+    last = _arrived;
+    if (monotonicSeconds() - lastChange > kStandstillSeconds) throw std::runtime_error("events were lost: " + counts);
     std::this_thread::sleep_for(std::chrono::milliseconds(5));
   }
 }
