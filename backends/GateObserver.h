@@ -15,7 +15,7 @@ enum class Gate : uint8_t {
   Expedite,                // setting; tested: whether events are batched
   UserInfoRequired,        // setting; tested: yes or no. Without it every session is let through
   UserInfo,                // gate; tested: the user info
-  EntryKind,               // gate of each entry, as the next three; against: the entry
+  EntryKind,               // gate of each entry, as the next three; against: what stands there instead
   ClientName,              // tested: the client's name
   ServiceName,             // tested: the service's name
   EnabledSince,            // tested: the framework's version

@@ -133,7 +133,7 @@ const Dictionary* HTTPSPostBackend::matchingEntry(const Array& clients, const Se
 
 bool HTTPSPostBackend::isMatchingEntry(const Value& entry, const SessionNames& names) const {
   const Dictionary* client = entry.dictionary();
-  return passes(Gate::EntryKind, client != nullptr, Value::none(), entry) &&
+  return passes(Gate::EntryKind, client != nullptr, Value::none(), client != nullptr ? Value::none() : entry) &&
          passes(Gate::ClientName, matchClientName(*client, names), names.client, (*client)[kClientEntryClient]) &&
          passes(Gate::ServiceName, matchServiceID(*client, names), names.service, (*client)[kClientEntryService]) &&
          passes(Gate::EnabledSince, isFrameworkEnabledForClient(*client), selfVersionText(),

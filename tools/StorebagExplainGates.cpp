@@ -67,6 +67,18 @@ std::string listOf(const Array& array) {
   return "[" + list + "]";
 }
 
+std::string wholeText(const Value& value) {
+  if (!value.isPresent()) return "none";
+  if (const Array* array = value.array()) return listOf(*array);
+  if (value.isString()) return std::string(value.text());
+  const Result<std::string> text = json::serialize(value);
+  if (text.has_value()) return *text;
+  return description(value);
+}
+
+// A bag's text must not steer a terminal, nor look like another line.
+bool isControl(char c) noexcept { return static_cast<unsigned char>(c) < ' ' || c == '\x7f'; }
+
 std::string expediteSentence(const GateStep& step) {
   const std::string_view words = batchingWords(step.answer.tested.booleanValue());
   if (isTaken(step)) return fmt::format("{}, so events {}", shortText(step.answer.against), words);
@@ -84,7 +96,7 @@ std::string nameSentence(const GateStep& step, std::string_view yes, std::string
 std::string enabledSinceSentence(const GateStep& step) {
   if (!step.answer.against.isString()) return "any framework version";
   return fmt::format("framework {} is {} {}", step.answer.tested.text(), isPassed(step) ? "not below" : "below",
-                     step.answer.against.text());
+                     shortText(step.answer.against));
 }
 
 std::string consentSentence(const GateStep& step) {
@@ -120,7 +132,7 @@ std::string filtersSentence(const GateStep& step) {
     const Dictionary& fields = *filter.dictionary();
     list += fmt::format("{}{} {}", list.empty() ? "" : ", ", fields[kFilterKey].text(), fields[kFilterAction].text());
   }
-  return fmt::format("{}: {}", filters->size(), list);
+  return fmt::format("{}: {}", filters->size(), shortText(list));
 }
 
 std::string countryThresholdSentence(const GateStep& step) {
@@ -312,14 +324,13 @@ const Value& settingAfter(const BackendExplanation& backend, Gate gate) noexcept
 }
 
 std::string shortText(const Value& value) {
-  if (!value.isPresent()) return "none";
-  if (const Array* array = value.array()) return listOf(*array);
-  if (value.isString()) return std::string(value.text());
-  const Result<std::string> text = json::serialize(value);
-  if (text.has_value()) return *text;
-  std::string described = description(value);
-  std::replace(described.begin(), described.end(), '\n', ' ');
-  return described;
+  constexpr size_t kLongest = 1000;
+  std::string text = wholeText(value);
+  std::replace_if(text.begin(), text.end(), isControl, ' ');
+  if (text.size() <= kLongest) return text;
+  size_t end = kLongest;
+  while ((static_cast<unsigned char>(text[end]) & 0xC0) == 0x80) --end;  // not in the middle of a character
+  return text.substr(0, end) + "...";
 }
 
 }  // namespace telvane

@@ -26,7 +26,7 @@ std::string eventsSentence(const BackendExplanation& backend, const StorebagExpl
 std::string notMadeSentence(const BackendExplanation& backend, const StorebagExplainCase& situation);
 // Returns what the setting is after the decision; an absent value when the decision did not come so far.
 const Value& settingAfter(const BackendExplanation& backend, Gate gate) noexcept;
-// A value on one line; "none" for an absent one.
+// A value on one line, cut after 1000 bytes; "none" for an absent one.
 std::string shortText(const Value& value);
 
 }  // namespace telvane

@@ -59,11 +59,11 @@ std::string macrosText(const StorebagExplanation& explanation) {
   for (const DictionaryEntry& macro : explanation.macros) {
     const auto& used = explanation.usedMacros;
     const bool isUsed = std::find(used.begin(), used.end(), macro.key) != used.end();
-    text += fact(text.empty() ? "macros" : "",
-                 fmt::format("{} = {}{}", macro.key, shortText(macro.value), isUsed ? "" : " (not used here)"));
+    text += fact(text.empty() ? "macros" : "", fmt::format("{} = {}{}", shortText(macro.key), shortText(macro.value),
+                                                           isUsed ? "" : " (not used here)"));
   }
   for (const String& name : explanation.undefinedMacros) {
-    text += fact(text.empty() ? "macros" : "", fmt::format("{} is not defined and stays as it is", name));
+    text += fact(text.empty() ? "macros" : "", fmt::format("{} is not defined and stays as it is", shortText(name)));
   }
   return text;
 }
@@ -89,13 +89,14 @@ std::string logText(const std::vector<KeptLog::Line>& lines) {
     for (size_t at = message.find('\n'); at != std::string::npos; at = message.find('\n', at)) {
       message.replace(at, 1, "\\n");
     }
-    text += fmt::format("  log      {}{}\n", line.level == LogLevel::Error ? "<error> " : "", message);
+    text += fmt::format("  log      {}{}\n", line.level == LogLevel::Error ? "<error> " : "", shortText(message));
   }
   return text;
 }
 
 std::string backendText(const BackendExplanation& backend, const StorebagExplainReport& report, ExplainedLog log) {
-  std::string text = fmt::format("\n{}: {}\n", backend.name, backend.isMade ? stateName(backend.state) : "not made");
+  std::string text =
+      fmt::format("\n{}: {}\n", shortText(backend.name), backend.isMade ? stateName(backend.state) : "not made");
   if (const GateStep* step = decidingStep(backend)) {
     text += fmt::format("  because  {}: {}\n", gateName(step->answer.gate), gateSentence(*step));
     text += fmt::format("  events   {}\n", eventsSentence(backend, report.situation));

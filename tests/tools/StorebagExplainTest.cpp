@@ -51,7 +51,7 @@ class StorebagExplainTest : public BackendFixture {
   std::string output() const { return _output.str(); }
   std::string errors() const { return _errors.str(); }
   void givenBag(const Dictionary& bag) {
-    _scratch.write("bag", propertylist::serialize(bag, propertylist::Format::XML).value().view());
+    _scratch.write("bag", propertylist::serialize(bag, propertylist::Format::Binary).value().view());
   }
   Dictionary bag() const {
     Dictionary section;
@@ -335,6 +335,28 @@ TEST_F(StorebagExplainTest, saysWhichFieldsFiltersTouch) {
   EXPECT_EQ(explained["filters"].array()->size(), 2u);
   run({"explain", "@bag", "--country", "US"});
   EXPECT_THAT(output(), HasSubstr("2: account sha256, name none\n"));
+}
+
+TEST_F(StorebagExplainTest, aBagsTextCannotSteerATerminalOrLookLikeAnotherLine) {
+  _client.set(kClientEntryLocaleWhitelist, Array{"\x1b[2J\nsplunk: enabled"});
+  Dictionary section;
+  section.set("splunk\nqrs", profile());
+  givenBag({{kEnvironmentRelease, section}});
+  ASSERT_EQ(run({"explain", "@bag", "--log"}), 0) << errors();
+  EXPECT_THAT(output(), HasSubstr("\nsplunk qrs: disabled\n"));
+  EXPECT_THAT(output(), Not(HasSubstr("\x1b")));
+  EXPECT_THAT(output(), Not(HasSubstr("\nsplunk: enabled")));
+}
+
+TEST_F(StorebagExplainTest, cutsLongListsInTheTextAndKeepsThemInJSON) {
+  Array countries{"US"};
+  for (int n = 0; n < 1000; ++n) countries.append("\u00c4\u00d6");
+  _client.set(kClientEntryLocaleWhitelist, countries);
+  const Dictionary explained = explainBackend(0, {"--country", "FR"});
+  EXPECT_EQ((*explained["because"].dictionary())["against"].array()->size(), 1001u);
+  ASSERT_EQ(run({"explain", "@bag", "--country", "FR"}), 0);
+  EXPECT_THAT(output(), HasSubstr("...\n"));
+  EXPECT_LT(output().size(), 8000u);
 }
 
 TEST_F(StorebagExplainTest, saysWhichEnvironmentsThereAreWhenTheOneAskedForIsMissing) {

@@ -27,5 +27,18 @@ TEST(KeptLogTest, keepsNothingBelowItsLevel) {
   EXPECT_TRUE(log.take().empty());
 }
 
+TEST(KeptLogTest, saysHowManyLinesFoundNoRoom) {
+  KeptLog log;
+  const std::string megabyte(1u << 20, 'x');
+  for (int n = 0; n < 6; ++n) log.message("{}", megabyte);
+  const std::vector<KeptLog::Line> lines = log.take();
+  ASSERT_EQ(lines.size(), 5u);
+  EXPECT_EQ(lines[3].message, megabyte);
+  EXPECT_EQ(lines[4].level, LogLevel::Error);
+  EXPECT_EQ(lines[4].message, "2 more lines found no room");
+  log.message("room again");
+  EXPECT_EQ(log.take().size(), 1u);
+}
+
 }  // namespace
 }  // namespace telvane
