@@ -39,9 +39,10 @@ class ExplainTest : public ::testing::Test {
 
   // Runs the program to its end and returns what it printed.
   std::string run(const std::string& program, const std::vector<std::string>& arguments) {
-    const int status = instance.startProgram(program, arguments, program)->wait();
-    EXPECT_EQ(status, 0) << instance.read(program + ".err");
-    return instance.read(program + ".out");
+    const std::string name = program + std::to_string(++_runs);
+    const int status = instance.startProgram(program, arguments, name)->wait();
+    EXPECT_EQ(status, 0) << instance.read(name + ".err");
+    return instance.read(name + ".out");
   }
   Array explain(int clientType, const Dictionary& bag) {
     instance.givenFile("bag.json", json::serialize(bag).value());
@@ -84,11 +85,14 @@ class ExplainTest : public ::testing::Test {
     const std::string said =
         run("telvanectl", {"send", "--client-type", std::to_string(clientType), "--client-name", "demo",
                            "--service-name", "explained", "--category", "21", "--type", "1"});
-    EXPECT_THAT(said, ::testing::StartsWith(expected + "\n"));
+    EXPECT_THAT(said, ::testing::HasSubstr(expected + "\n"));
     expectLogged(backends);
   }
 
   Instance instance;
+
+ private:
+  int _runs = 0;
 };
 
 TEST_F(ExplainTest, theDaemonEnablesWhatExplainCallsEnabledAndLogsWhatItForetells) {
