@@ -62,7 +62,9 @@ void MacroLint::lintReference(const std::string& path, std::string_view text, Pl
   } else {
     std::vector<std::string_view> names;
     if (_macros != nullptr && _macros->size() <= kMostNames) {
-      for (const DictionaryEntry& macro : *_macros) names.push_back(macro.key);
+      for (const DictionaryEntry& macro : *_macros) {
+        if (macro.key.view().starts_with(kMacroPrefix)) names.push_back(macro.key);
+      }
     }
     const auto nearest = nearestName(text, names);
     _report.error(path,

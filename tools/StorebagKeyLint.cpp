@@ -217,9 +217,9 @@ void StorebagKeyLint::lintVersion(const std::string& path, const Row& row, const
     }
   }
   if (parts == kVersionParts) return;
-  _report.warning(path,
-                  fmt::format("{} has {} parts of three, {}; {}", quoted(value.text()), parts,
-                              parts < kVersionParts ? "and the missing ones are 0" : "and the rest is ignored", kForm));
+  const char* what = parts < kVersionParts ? "lacks parts, which count as 0"
+                                           : "has more than three parts, of which the rest is ignored";
+  _report.warning(path, fmt::format("{} {}; {}", quoted(value.text()), what, kForm));
 }
 
 void StorebagKeyLint::lintURL(const std::string& path, const Row& row, const Value& value) {
@@ -405,6 +405,9 @@ void StorebagKeyLint::lintCountry(const std::string& path, const Row& row, std::
   } else if (code.size() == 1 && isContainedIn) {
     _report.error(path, fmt::format("{} fits every country whose code has that letter; write two upper-case letters",
                                     quoted(code)));
+  } else if (hasBlankAtAnEnd(code)) {
+    _report.error(
+        path, fmt::format("{} has a blank that is part of it, and fits no device; take the blank out", quoted(code)));
   } else {
     _report.error(path,
                   fmt::format("{} is no country code and fits no device; write two upper-case letters", quoted(code)));
@@ -412,9 +415,12 @@ void StorebagKeyLint::lintCountry(const std::string& path, const Row& row, std::
 }
 
 void StorebagKeyLint::lintCategories(const std::string& path, const Row& row, const Value& value) {
-  const Array* elements = elementsOf(path, row, value, kReadAsAbsent);
+  const bool isWhitelist = row.key == kClientEntryEventWhitelist;
+  const Array* elements = elementsOf(path, row, value,
+                                     isWhitelist ? "devices read it as an empty array, which admits nothing"
+                                                 : "devices read it as an empty array, which bars nothing");
   if (elements == nullptr) return;
-  if (elements->empty() && row.key == kClientEntryEventWhitelist) {
+  if (elements->empty() && isWhitelist) {
     _report.warning(path, "is empty and admits no category: nothing is reported; take it out to admit all");
   }
   for (size_t i = 0; i < elements->size() && _report.mayGoOn(); ++i) lintCategory(pathTo(path, i), row, (*elements)[i]);

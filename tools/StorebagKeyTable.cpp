@@ -97,16 +97,17 @@ constexpr StorebagKey kClientEntryKeys[] = {
     {kClientEntryPerCountrySamplingThresholds, Shape::CountryThresholds, Optional, "none",
      "Thresholds of single countries.",
      "The first item that lists the device's country replaces `sampling_threshold`."},
-    {kClientEntryOverrideSampling, Shape::Share, Optional, "none: all of them wait",
+    {kClientEntryOverrideSampling, Shape::Share, Optional, "none: all of them may",
      "Which of the devices that sampling left out may still be promoted.",
-     "A device whose number is below it keeps its events and sends them when a promoting message (flag 2 or 3) comes; "
-     "the others are disabled. Looked at only when the number is not below the sampling threshold."},
+     "A device whose number is below it keeps its events, and sends them after a promoting message (flag 2 or 3); the "
+     "others are disabled. Looked at only when the number is not below the sampling threshold."},
     {kClientEntryCustomClientId, Shape::Any, Optional, "the device's identifier",
      "Report under an identifier of the client and service alone.",
      "It is enough that the key is there; its value is not looked at."},
     {kClientEntryEventThreshold, Shape::EventThreshold, Optional, "49",
-     "How large a batch grows: the number of one category's events that is still waited with.",
-     "The event after next posts all that waits: with 49, the 51st of a category. A negative number: every event."},
+     "How many events of one category may wait before all that waits is posted.",
+     "With 49, the 51st event of a category posts the 50 before it, and what waits of other categories, and begins the "
+     "next batch. With a negative number, every event does."},
     {kClientEntryExtrasOnInternal, Shape::Switch, Optional, "0",
      "1: report under the device's identifier, on internal builds only.", "Stands above `custom_clientId`."},
     {kClientEntryEventWhitelist, Shape::Categories, Optional, "all categories",

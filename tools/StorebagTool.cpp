@@ -143,12 +143,11 @@ Result<void> StorebagTool::show() {
 }
 
 Result<void> StorebagTool::lint() {
+  constexpr char kAdvice[] = "; name a property list, JSON or a signed envelope";
   const Result<Data> bytes = readFile(_bagFile);
-  if (bytes.has_error()) return bytes.error();
+  if (bytes.has_error()) return fault(bytes.error().description() + kAdvice);
   const Result<LintReport> report = StorebagLint::lintFile(*bytes);
-  if (report.has_error()) {
-    return fault(_bagFile + ": " + report.error().description() + "; name a property list, JSON or a signed envelope");
-  }
+  if (report.has_error()) return fault(_bagFile + ": " + report.error().description() + kAdvice);
   for (const LintFinding& finding : report->findings()) {
     const bool isError = finding.severity == LintFinding::Severity::Error;
     _output << (isError ? "error: " : "warning: ") << finding.path << ": " << finding.text << "\n";

@@ -9,8 +9,8 @@
 
 namespace telvane {
 
-// The program telvane-storebag: makes keys, signs bags, verifies and shows envelopes, explains what bags do. Made for
-// one command line.
+// The program telvane-storebag: makes keys, signs bags, verifies and shows envelopes, explains what bags do and names
+// the mistakes in them. Made for one command line.
 class StorebagTool {
  public:
   // files and streams outlive the tool. Results go to output, faults as one line each to errors.
