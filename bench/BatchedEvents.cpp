@@ -160,6 +160,8 @@ void addRounds(FigureTable& figures, const Rounds& rounds) {
                Goal{Goal::Kind::AtMost, 1.6}});
   addSeries(figures, "daemon, the same, log at default", rounds.logging, {});
   figures.add({"log at default: CPU ratio to log at error", rounds.loggingRatio, "", 2, Goal{Goal::Kind::AtMost, 1.3}});
+  addSeries(figures, "daemon, the same with a digest in every event", rounds.digest, {});
+  figures.add({"daemon, the same with a digest in every event: CPU ratio to ceiling", rounds.digestRatio});
 }
 
 }  // namespace

@@ -46,6 +46,8 @@ TEST_F(RoadProgramTest, aPartAloneSaysNothingOfTheOthers) {
   ASSERT_EQ(run({"--only", "batched", "--events", "300", "--rounds", "2"}), 0) << errors();
   EXPECT_THAT(output(), HasSubstr("daemon, filters and white list: CPU ratio to ceiling"));
   EXPECT_THAT(output(), HasSubstr("at most 1.60"));
+  EXPECT_THAT(output(), HasSubstr("log at default: CPU ratio to log at error"));
+  EXPECT_THAT(output(), HasSubstr("with a digest in every event: CPU ratio to ceiling"));
   EXPECT_THAT(output(), HasSubstr("2 rounds"));
   for (const char* other : {"eal-time", "104 sessions", "quarter of the run"})
     EXPECT_THAT(output(), Not(HasSubstr(other)));
