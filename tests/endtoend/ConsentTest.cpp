@@ -261,13 +261,19 @@ INSTANTIATE_TEST_SUITE_P(Bags, ConsentOverriddenTest,
                          [](const auto& bag) { return std::string(bag.param.name); });
 
 // A setting that is no plain yes.
-class ConsentSettingTest : public ConsentFixture,
-                           public ::testing::WithParamInterface<std::pair<const char*, Value>> {};
+struct Setting {
+  const char* name;
+  Value value;
+};
+
+void PrintTo(const Setting& setting, std::ostream* stream) { *stream << setting.name; }
+
+class ConsentSettingTest : public ConsentFixture, public ::testing::WithParamInterface<Setting> {};
 
 TEST_P(ConsentSettingTest, thatIsNoYesMeansNo) {
   givenSection(section("splunk", Array{Value(clientEntry())}));
   Dictionary setting;
-  setting.set("AutoSubmit", GetParam().second);
+  setting.set("AutoSubmit", GetParam().value);
   instance().givenFile("home/Library/Preferences/com.corvex.diagnostics.plist",
                        propertylist::serialize(setting, propertylist::Format::Binary).value().view());
   runToTheEnd();
@@ -275,10 +281,9 @@ TEST_P(ConsentSettingTest, thatIsNoYesMeansNo) {
 }
 
 INSTANTIATE_TEST_SUITE_P(Settings, ConsentSettingTest,
-                         ::testing::Values(std::pair("absent", Value()), std::pair("no", Value(false)),
-                                           std::pair("number", Value(1)), std::pair("text", Value("YES")),
-                                           std::pair("list", Value(Array{true}))),
-                         [](const auto& setting) { return std::string(setting.param.first); });
+                         ::testing::Values(Setting{"absent", Value()}, Setting{"no", false}, Setting{"number", 1},
+                                           Setting{"text", "YES"}, Setting{"list", Array{true}}),
+                         [](const auto& setting) { return std::string(setting.param.name); });
 
 class ConsentTest : public ConsentFixture {
  protected:
