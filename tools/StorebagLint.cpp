@@ -109,6 +109,7 @@ void StorebagLint::lintInner(const Dictionary& bag) {
                   fmt::format("is nested deeper than {} levels, and no device reads it; make it flatter", kMostLevels));
     return;
   }
+  lintForm(bag);
   StorebagKeyLint(_report, Audience::Everybody).lint({}, StorebagLevel::Bag, bag);
   lintMissingSections(bag);
   MacroLint macros(_report, bag);
@@ -126,6 +127,19 @@ void StorebagLint::lintInner(const Dictionary& bag) {
           .reportKind(place, storebagShapeName(StorebagShape::Section), section,
                       "devices of this environment get no bag");
     }
+  }
+}
+
+// What JSON holds and a property list does not, and what is too much for a device.
+void StorebagLint::lintForm(const Dictionary& bag) {
+  const Result<Data> bytes = propertylist::serialize(bag, propertylist::Format::Binary);
+  if (bytes.has_error()) {
+    _report.error({},
+                  fmt::format("cannot be made a property list ({}), so it cannot be signed; take out what it cannot "
+                              "hold, such as null",
+                              bytes.error().description()));
+  } else if (const Result<Value> read = propertylist::parse(*bytes); read.has_error()) {
+    _report.error({}, fmt::format("is refused by devices ({}); make it smaller", read.error().description()));
   }
 }
 

@@ -23,6 +23,7 @@ class StorebagLint {
 
   void lintEnvelope(const Dictionary& envelope, bool isPropertyList);
   void lintInner(const Dictionary& bag);
+  void lintForm(const Dictionary& bag);
   void lintMissingSections(const Dictionary& bag);
   void lintSection(const std::string& path, const Dictionary& section, StorebagKeyLint::Audience audience);
   void lintBackend(const std::string& path, std::string_view name, const Value& profile, StorebagKeyLint& keys);
