@@ -15,6 +15,7 @@
 #include "tools/ClientListLint.h"
 #include "tools/LintText.h"
 #include "tools/MacroLint.h"
+#include "tools/RepeatedKeys.h"
 #include "tools/StorebagEnvelope.h"
 
 namespace telvane {
@@ -65,9 +66,14 @@ std::optional<Data> decoded(const Value& text) {
 Result<LintReport> StorebagLint::lintFile(const Data& bytes) {
   const Result<Dictionary> written = storebagenvelope::parseBag(bytes);
   if (written.has_error()) return written.error();
-  if (!written->contains(kEnvelopeBag) && !written->contains(kEnvelopeSignature)) return lintBag(*written);
   LintReport report;
-  StorebagLint(report).lintEnvelope(*written, propertylist::parse(bytes).has_value());
+  RepeatedKeys(report, bytes.view()).lint();
+  StorebagLint lint(report);
+  if (written->contains(kEnvelopeBag) || written->contains(kEnvelopeSignature)) {
+    lint.lintEnvelope(*written, propertylist::parse(bytes).has_value());
+  } else {
+    lint.lintInner(*written);
+  }
   return report;
 }
 

@@ -448,6 +448,29 @@ TEST(StorebagLintTest, namesWhatIsWrongWithAnEnvelope) {
               ElementsAre(error("/", "is an envelope in JSON, which no device reads")));
 }
 
+// A parser takes the last of two equal keys and says nothing.
+TEST(StorebagLintTest, namesAKeyThatIsWrittenTwice) {
+  const std::string twice = "stands twice";
+  const std::string clean = *json::serialize(bagOf(Array{cleanEntry()}));
+  EXPECT_THAT(lintFile(clean), IsEmpty());
+  EXPECT_THAT(lintFile(plist(bagOf(Array{cleanEntry()}))), IsEmpty());
+  const auto linesAboutRepeatedKeys = [&twice](const std::string& text) {
+    std::vector<std::string> lines = lintFile(text);
+    std::erase_if(lines, [&twice](const std::string& line) { return line.find(twice) == std::string::npos; });
+    return lines;
+  };
+  EXPECT_THAT(
+      linesAboutRepeatedKeys(R"({"version": "1", "release": {"splunk": {"clients": [1, {"a": [{}, "\"{,", {"a": 1}]},
+                                     {"post_url": "x,{", "b": {"post_url": 1}, "post\u005furl": "y", "c": 1}]}}})"),
+      ElementsAre(error("release/splunk/clients[2]/post_url", twice)));
+  EXPECT_THAT(linesAboutRepeatedKeys(R"(<?xml version="1.0"?><!DOCTYPE plist><plist version="1.0"><!-- <key>x</key> -->
+      <dict><key>a&amp;b</key><array><dict/><string>s</string><true/><array/><dict><key>k</key><string>1</string>
+      <key>n</key><dict><key>k</key><integer>1</integer></dict><key>k</key><string>2</string></dict></array>
+      <key>version</key><string><![CDATA[<key>version</key>]]></string><key>a&amp;b</key><true/></dict></plist>)"),
+              ElementsAre(error("\"a&b\"[4]/k", twice), error("\"a&b\"", twice)));
+  EXPECT_EQ((*storebagenvelope::parseBag(Data(std::string(R"({"a": 1, "a": 2})"))))["a"], Value(2));
+}
+
 // Bags from anybody.
 
 std::vector<Value> valuesOfEveryKind() {
