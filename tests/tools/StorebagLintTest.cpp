@@ -4,80 +4,22 @@
 #include <gtest/gtest.h>
 
 #include <limits>
-#include <sstream>
 
 #include "foundation/Base64.h"
-#include "interfaces/StorebagKeys.h"
-#include "platform/JSON.h"
-#include "platform/PropertyList.h"
-#include "platform/system/PosixFileSystem.h"
-#include "tests/support/ScratchFolder.h"
+#include "tests/tools/LintBags.h"
 #include "tools/StorebagEnvelope.h"
-#include "tools/StorebagTool.h"
 
 namespace telvane::testing {
 namespace {
 
-using ::testing::AllOf;
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 using ::testing::IsEmpty;
-using ::testing::StartsWith;
 
 constexpr char kEntry[] = "release/splunk/clients[0]";
 constexpr double kNaN = std::numeric_limits<double>::quiet_NaN();
 constexpr double kInfinity = std::numeric_limits<double>::infinity();
 
-std::vector<std::string> linesOf(const LintReport& report) {
-  std::vector<std::string> lines;
-  for (const LintFinding& finding : report.findings()) {
-    const bool isError = finding.severity == LintFinding::Severity::Error;
-    lines.push_back((isError ? "error: " : "warning: ") + finding.path + ": " + finding.text);
-  }
-  return lines;
-}
-
-// One finding at this place whose text has this part.
-auto finding(const char* severity, const std::string& path, const std::string& part) {
-  return AllOf(StartsWith(std::string(severity) + ": " + path + ": "), HasSubstr(part));
-}
-auto error(const std::string& path, const std::string& part) { return finding("error", path, part); }
-auto warning(const std::string& path, const std::string& part) { return finding("warning", path, part); }
-
-Value parsed(const std::string& json) {
-  const Result<Value> value = json::parse(json);
-  EXPECT_TRUE(value.has_value()) << json;
-  return value.has_value() ? *value : Value();
-}
-
-// An entry in which there is nothing to complain about.
-Dictionary cleanEntry() {
-  return *parsed(R"({"post_url": "https://collector.example/events", "locale_whitelist": ["US", "DE"], "filters": [],
-                     "sampling_threshold": 0.5})")
-              .dictionary();
-}
-Dictionary entryWith(const char* key, Value value) {
-  Dictionary entry = cleanEntry();
-  entry.set(key, std::move(value));
-  return entry;
-}
-Dictionary sectionOf(Array clients) { return {{Key("splunk"), Dictionary{{kProfileClients, std::move(clients)}}}}; }
-// A bag whose section for customers has these client entries, and in which there is nothing else to complain about.
-Dictionary bagOf(Array clients) {
-  const Dictionary clean = sectionOf(Array{cleanEntry()});
-  return {{kStorebagVersion, "7"},
-          {kEnvironmentDevelopment, clean},
-          {kEnvironmentInternal, clean},
-          {kEnvironmentSeed, clean},
-          {kEnvironmentRelease, sectionOf(std::move(clients))}};
-}
-Dictionary bagWith(const char* key, Value value) {
-  Dictionary bag = bagOf(Array{cleanEntry()});
-  bag.set(key, std::move(value));
-  return bag;
-}
-
-std::vector<std::string> lintBag(const Dictionary& bag) { return linesOf(StorebagLint::lintBag(bag)); }
 std::vector<std::string> lintEntries(Array clients) { return lintBag(bagOf(std::move(clients))); }
 std::vector<std::string> lintEntry(const char* key, Value value) {
   return lintEntries(Array{entryWith(key, std::move(value))});
@@ -407,9 +349,6 @@ TEST(StorebagLintTest, internalBuildsReallySendPlainHTTP) {
 
 // Envelopes.
 
-std::string plist(const Value& value) {
-  return std::string(propertylist::serialize(value, propertylist::Format::XML).value().view());
-}
 std::string base64(const Value& value) {
   const Data bytes = propertylist::serialize(value, propertylist::Format::Binary).value();
   return base64Encode({bytes.bytes(), bytes.size()});
@@ -469,249 +408,6 @@ TEST(StorebagLintTest, namesAKeyThatIsWrittenTwice) {
       <key>version</key><string><![CDATA[<key>version</key>]]></string><key>a&amp;b</key><true/></dict></plist>)"),
               ElementsAre(error("\"a&b\"[4]/k", twice), error("\"a&b\"", twice)));
   EXPECT_EQ((*storebagenvelope::parseBag(Data(std::string(R"({"a": 1, "a": 2})"))))["a"], Value(2));
-}
-
-// Bags from anybody.
-
-std::vector<Value> valuesOfEveryKind() {
-  const Dictionary nested{{Key("a"), Array{Dictionary{{Key("b"), Array{Array{1}}}}}}};
-  Array withNull;
-  withNull.append(Value());
-  withNull.append("x");
-  return {true,
-          false,
-          0,
-          1,
-          -1,
-          65536,
-          std::numeric_limits<int64_t>::max(),
-          std::numeric_limits<int64_t>::min(),
-          std::numeric_limits<uint64_t>::max(),
-          0.5,
-          -0.0,
-          1e308,
-          kNaN,
-          kInfinity,
-          -kInfinity,
-          "",
-          "x",
-          "1",
-          "-1e999",
-          "==",
-          "==MACRO",
-          "==NONE",
-          ",",
-          ",,a, b",
-          std::string(100000, 'x'),
-          std::string("a\nb\x1b[31m\x7f\xff\xc2\x9b"),
-          std::string(100, ','),
-          Data(std::string("\0\1\2", 3)),
-          Data(),
-          Date(),
-          Array(),
-          Array{""},
-          Array{1, "a", 1.5},
-          Array{Array{}},
-          Array{Dictionary()},
-          withNull,
-          Dictionary(),
-          nested};
-}
-
-// A finding must be one line that a terminal can show, whatever the bag is called or holds.
-void expectReadable(const Dictionary& bag, const std::string& what) {
-  for (const std::string& line : lintBag(bag)) {
-    EXPECT_LT(line.size(), 1200u) << what;
-    for (const char c : line) {
-      if (static_cast<unsigned char>(c) >= 0x20 && c != 0x7f) continue;
-      ADD_FAILURE() << what << ": " << ::testing::PrintToString(line);
-      break;
-    }
-    EXPECT_EQ(line.find("\xc2\x9b"), std::string::npos) << what;
-  }
-}
-
-// The bag with one value put at one key of one kind of dictionary.
-Dictionary bagWithValueAt(StorebagLevel level, std::string_view key, const Value& value) {
-  Dictionary changed;
-  const auto put = [&changed, key, &value](Dictionary dictionary) {
-    dictionary.set(String(key), value);
-    return changed = std::move(dictionary);
-  };
-  const auto section = [](const char* name, const Dictionary& profile) {
-    Dictionary result;
-    result.set(name, profile);
-    return bagWith("release", result);
-  };
-  switch (level) {
-    case StorebagLevel::Envelope:
-    case StorebagLevel::Bag:
-      return put(bagOf(Array{cleanEntry()}));
-    case StorebagLevel::HTTPSProfile:
-      return section("splunk", put({{kProfileClients, Array{cleanEntry()}}}));
-    case StorebagLevel::ClientEntry:
-      return bagOf(Array{put(cleanEntry())});
-    case StorebagLevel::Filter:
-      return bagOf(Array{entryWith("filters", Array{put({{kFilterKey, "k"}, {kFilterAction, "remove"}})})});
-    case StorebagLevel::CountryThreshold:
-      return bagOf(Array{entryWith("per_country_sampling_thresholds",
-                                   Array{put({{kPerCountryCountry, Array{"US"}}, {kPerCountryThreshold, 1}})})});
-    case StorebagLevel::UploadProfile:
-      return section("upload_server", put({{kProfilePostURL, "https://a.example/"}}));
-    case StorebagLevel::DashboardProfile:
-      return section("dashboard", put({{kProfileIP, "192.0.2.1"}, {kProfilePort, 9}}));
-    case StorebagLevel::PlainProfile:
-      return section("vdr", put({}));
-  }
-  return {};
-}
-
-TEST(StorebagLintTest, takesAnyValueAtAnyKey) {
-  for (const StorebagLevel level : kStorebagLevels) {
-    for (const StorebagKey& row : storebagKeys(level)) {
-      for (const Value& value : valuesOfEveryKind()) {
-        Dictionary bag = bagWithValueAt(level, row.key, value);
-        if (row.key != kStorebagSharedValues) bag.set(kStorebagSharedValues, Dictionary{{Key("==MACRO"), value}});
-        expectReadable(bag, std::string(row.key.view()) + " = " + description(value).substr(0, 100));
-      }
-    }
-  }
-}
-
-TEST(StorebagLintTest, neverTakesADateOrDataForWhatAKeyNeeds) {
-  for (const StorebagLevel level : kStorebagLevels) {
-    for (const StorebagKey& row : storebagKeys(level)) {
-      const bool isOfEnvelope = level == StorebagLevel::Envelope;
-      if (row.shape == StorebagShape::Any || isOfEnvelope) continue;
-      for (const Value& value : {Value(Date()), Value(Data(std::string("x")))}) {
-        const LintReport report = StorebagLint::lintBag(bagWithValueAt(level, row.key, value));
-        EXPECT_EQ(report.count(LintFinding::Severity::Error), 1u) << row.key.view();
-      }
-    }
-  }
-}
-
-TEST(StorebagLintTest, takesAnyNameForAKeyOrBackend) {
-  for (const std::string& name :
-       {std::string(""), std::string(" "), std::string("a/b[3]"), std::string(100000, 'k'), std::string("a\nb\x1b[0m"),
-        std::string("\xff\xfe"), std::string("==X"), std::string("clients"), std::string("\0x", 2)}) {
-    Dictionary entry = cleanEntry();
-    entry.set(String(name), 1);
-    Dictionary section = sectionOf(Array{entry});
-    section.set(String(name), Dictionary());
-    Dictionary bag = bagWith("release", section);
-    bag.set(String(name), 1);
-    Dictionary macros;
-    macros.set(String(name), "x");
-    bag.set(kStorebagSharedValues, macros);
-    expectReadable(bag, name.substr(0, 20));
-    EXPECT_GE(StorebagLint::lintBag(bag).count(LintFinding::Severity::Error), 3u) << name.substr(0, 20);
-  }
-}
-
-TEST(StorebagLintTest, refusesABagThatIsTooDeep) {
-  Value deep = 1;
-  for (int i = 0; i < 200; ++i) deep = Array{std::move(deep)};
-  EXPECT_THAT(lintBag(bagWith("release", Dictionary{{Key("splunk"), deep}})),
-              ElementsAre(error("/", "is nested deeper than 64 levels")));
-}
-
-TEST(StorebagLintTest, namesWhatNoPropertyListCanHold) {
-  Dictionary bag = bagWith("release", parsed(R"({"splunk": {"clients": [null]}})"));
-  EXPECT_THAT(lintBag(bag), ElementsAre(error("/", "cannot be made a property list"),
-                                        error("release/splunk/clients[0]", "is null, and it is passed over")));
-  bag = bagWith("version", Value(std::string_view("a\0b", 3)));
-  EXPECT_THAT(lintBag(bag), ElementsAre(error("/", "holds text with a null character")));
-}
-
-TEST(StorebagLintTest, namesABagThatIsTooLargeForDevices) {
-  Array categories;
-  for (int i = 0; i < (1 << 20); ++i) categories.append(i % 100);
-  EXPECT_THAT(lintEntry("event_blacklist", categories), ElementsAre(error("/", "is refused by devices")));
-}
-
-TEST(StorebagLintTest, stopsAtAThousandFindings) {
-  Dictionary entry = cleanEntry();
-  for (int i = 0; i < 5000; ++i) entry.set(String("unknown" + std::to_string(i)), i);
-  const std::vector<std::string> lines = lintEntries(Array{entry});
-  ASSERT_EQ(lines.size(), LintReport::kMostFindings + 1);
-  EXPECT_THAT(lines.back(), error("/", "has more than 1000 findings"));
-}
-
-// A macro is stored once and looked at wherever it is used, so a small bag can stand for a huge one.
-TEST(StorebagLintTest, stopsWhenMacrosMakeTheBagHuge) {
-  Array filters;
-  for (int i = 0; i < 3000; ++i) {
-    filters.append(Dictionary{{kFilterKey, "k" + std::to_string(i)}, {kFilterAction, "remove"}});
-  }
-  Array clients;
-  for (int i = 0; i < 3000; ++i) {
-    Dictionary entry = entryWith("filters", "==FILTERS");
-    entry.set(kClientEntryClient, "c" + std::to_string(i));
-    clients.append(entry);
-  }
-  Dictionary bag = bagOf(clients);
-  bag.set(kStorebagSharedValues, Dictionary{{Key("==FILTERS"), filters}});
-  EXPECT_THAT(lintBag(bag), ElementsAre(error("/", "is too large to be looked through")));
-}
-
-// Each entry must be compared with all before it, which is not to take time in proportion to the square.
-TEST(StorebagLintTest, comparesManyEntriesInBoundedSteps) {
-  Array clients;
-  for (int i = 0; i < 5000; ++i) clients.append(entryWith("service", "s" + std::to_string(i) + "x"));
-  const std::vector<std::string> lines = lintEntries(clients);
-  ASSERT_EQ(lines.size(), 1u);
-  EXPECT_THAT(lines.front(), error("/", "is too large"));
-}
-
-// The command.
-
-class StorebagLintCommandTest : public ::testing::Test {
- protected:
-  int lint(const std::string& path) { return run({"telvane-storebag", "lint", path.c_str()}); }
-  int run(const std::vector<const char*>& arguments) {
-    _output.str("");
-    _errors.str("");
-    return StorebagTool(_files, _output, _errors).run(static_cast<int>(arguments.size()), arguments.data());
-  }
-  std::string write(const Value& bag) { return _scratch.write("bag", plist(bag)); }
-
-  ScratchFolder _scratch;
-  PosixFileSystem _files{Paths{}};
-  std::ostringstream _output;
-  std::ostringstream _errors;
-};
-
-TEST_F(StorebagLintCommandTest, exitsWithOneOnlyWhenThereIsAnError) {
-  EXPECT_EQ(lint(write(bagOf(Array{cleanEntry()}))), 0);
-  EXPECT_EQ(_output.str(), "0 errors, 0 warnings\n");
-  EXPECT_EQ(lint(write(bagWith("seed", Value()))), 0);
-  EXPECT_EQ(_output.str(),
-            "warning: seed: is missing: seed devices take release and log an error each time; add it if you have such "
-            "devices\n0 errors, 1 warning\n");
-  EXPECT_EQ(lint(write(bagWith("version", 5))), 1);
-  EXPECT_THAT(_output.str(), StartsWith("error: version: is a number"));
-  EXPECT_EQ(_errors.str(), "");
-}
-
-TEST_F(StorebagLintCommandTest, saysInOneLineWhyAFileCannotBeRead) {
-  for (const std::string& path :
-       {_scratch.at("nothing"), _scratch.path(), _scratch.write("text", "garbage"), _scratch.write("empty", ""),
-        _scratch.write("list", "[1]"), _scratch.write("deep", std::string(1000, '['))}) {
-    EXPECT_EQ(lint(path), 1) << path;
-    EXPECT_THAT(_errors.str(), StartsWith("telvane-storebag: ")) << path;
-    EXPECT_THAT(_errors.str(), HasSubstr("name a property list, JSON or a signed envelope")) << path;
-    EXPECT_EQ(_errors.str().find('\n'), _errors.str().size() - 1) << _errors.str();
-    EXPECT_EQ(_output.str(), "");
-  }
-}
-
-TEST_F(StorebagLintCommandTest, wrongUsageIsTwoAndTheHelpSaysSo) {
-  EXPECT_EQ(run({"telvane-storebag", "lint"}), 2);
-  EXPECT_EQ(run({"telvane-storebag", "lint", "a", "b"}), 2);
-  EXPECT_EQ(run({"telvane-storebag", "lint", "--help"}), 0);
-  EXPECT_THAT(_output.str(), HasSubstr("Exits 0 without errors, 1 with errors or when the file cannot be read, 2 on "
-                                       "wrong usage."));
 }
 
 }  // namespace
