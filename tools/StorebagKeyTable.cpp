@@ -119,7 +119,7 @@ constexpr StorebagKey kClientEntryKeys[] = {
     {kClientEntryIncludeSessionID, Shape::Switch, Optional, "0",
      "1: name the session in the header `X-TVN-Session-ID`.", "Its first 40 characters."},
     {kClientEntryUseWiFiOnly, Shape::Switch, Optional, "0", "1: do not post over a cellular network.",
-     "Posts wait until there is another."},
+     "Posts are marked so. Linux does not tell networks apart, so they go out all the same."},
 };
 
 constexpr StorebagKey kFilterKeys[] = {
