@@ -41,7 +41,7 @@ EventFilter::EventFilter(const Array& entries) {
         if (value.isString()) record.values.push_back(*value.string());
       }
     }
-    _keyLengths |= lengthMark(record.key);
+    _keyMarks |= keyMark(record.key);
     _records.push_back(std::move(record));
   }
 }
@@ -70,8 +70,15 @@ std::string_view EventFilter::textForAction(Action action) noexcept {
   return kNone;
 }
 
-uint64_t EventFilter::lengthMark(std::string_view key) noexcept {
-  return uint64_t{1} << std::min(key.size(), kLongestMarkedKey);
+// Keys that are equal but for case share a mark; of others few do.
+uint64_t EventFilter::keyMark(std::string_view key) noexcept {
+  constexpr unsigned kCaseBit = 0x20;
+  constexpr size_t kFactor = 7;  // odd, so that each part counts
+  constexpr size_t kMarks = 64;
+  if (key.empty()) return 1;
+  const size_t first = static_cast<uint8_t>(key.front()) | kCaseBit;
+  const size_t last = static_cast<uint8_t>(key.back()) | kCaseBit;
+  return uint64_t{1} << (((key.size() * kFactor + first) * kFactor + last) % kMarks);
 }
 
 Array EventFilter::description() const {
@@ -95,7 +102,7 @@ void EventFilter::filterEvent(Dictionary& event) const {
   const int32_t status = event[kEventStatus].int32Value();
   std::vector<Change> changes;
   for (const DictionaryEntry& entry : event) {
-    if ((_keyLengths & lengthMark(entry.key)) == 0) continue;
+    if ((_keyMarks & keyMark(entry.key)) == 0) continue;
     const Record* record = firstRecordFor(entry.key, method, status);
     if (record == nullptr) continue;
     if (auto change = changeFor(*record, entry)) changes.push_back(*std::move(change));

@@ -10,7 +10,7 @@
 namespace telvane {
 
 // The field filters of a storebag's client entry: what is taken out of events, or made unreadable, before they leave.
-// Prepared once, so that an event without anything to filter costs a look at the lengths of its keys. A value.
+// Prepared once, so that an event without anything to filter costs a look at the ends of its keys. A value.
 class EventFilter {
  public:
   EventFilter() = default;
@@ -44,18 +44,16 @@ class EventFilter {
     Value replacement;  // absent: the key is removed
   };
 
-  static constexpr size_t kLongestMarkedKey = 63;  // longer ones share a mark
-
   static Action actionForText(std::string_view text) noexcept;
   static std::string_view textForAction(Action action) noexcept;
-  static uint64_t lengthMark(std::string_view key) noexcept;
+  static uint64_t keyMark(std::string_view key) noexcept;
   static bool containsOneOf(const Value& value, const std::vector<String>& parts) noexcept;
   const Record* firstRecordFor(std::string_view key, int32_t method, int32_t status) const noexcept;
   // Returns what the record does to the key; nothing when all stays.
   static std::optional<Change> changeFor(const Record& record, const DictionaryEntry& entry);
 
   std::vector<Record> _records;
-  uint64_t _keyLengths = 0;  // one bit per length that a record's key has
+  uint64_t _keyMarks = 0;  // one bit for the mark of each record's key
 };
 
 }  // namespace telvane

@@ -32,7 +32,7 @@ class HTTPSPostBackend final : public TelvaneBackend {
   // Reads the storebag section anew: consent, country, device, sampling, filters, lists, URLs.
   uint32_t updateState() override;
   using TelvaneBackend::sendMessage;
-  std::optional<String> sendMessage(const Dictionary& blob, Date timestamp, uint16_t method, uint16_t respCode,
+  std::optional<String> sendMessage(Dictionary blob, Date timestamp, uint16_t method, uint16_t respCode,
                                     uint16_t eventID, uint32_t flag) override;
   // The completion comes with the server's answer; at once, on the caller's thread, when there is nothing to post.
   std::optional<String> flushMessagesWithCompletion(FlushCompletion completion) override;
@@ -113,11 +113,10 @@ class HTTPSPostBackend final : public TelvaneBackend {
 
   // Events.
   QueueState queueState() const;
-  Dictionary newEventDictFromPayload(const Dictionary& blob, Date timestamp, const EventNumbers& numbers,
-                                     Value sessionID);
+  Dictionary newEventDictFromPayload(Dictionary blob, Date timestamp, const EventNumbers& numbers, Value sessionID);
   void addSessionStopEntries(Dictionary& payload);
   void addDeviceEntries(Dictionary& event) const;
-  void prepareEvent(Dictionary& event, const Dictionary& blob) const;
+  void prepareEvent(Dictionary& event, const Value& sharedData) const;
   int64_t timezoneOffset(Date timestamp);
   std::optional<String> sendStandaloneEvent(Dictionary event, const QueueState& before, const EventNumbers& numbers,
                                             uint32_t flag);

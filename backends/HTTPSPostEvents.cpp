@@ -53,13 +53,14 @@ bool isSessionStop(uint16_t method, uint16_t respCode) { return method == kSessi
 
 }  // namespace
 
-std::optional<String> HTTPSPostBackend::sendMessage(const Dictionary& blob, Date timestamp, uint16_t method,
-                                                    uint16_t respCode, uint16_t eventID, uint32_t flag) {
+std::optional<String> HTTPSPostBackend::sendMessage(Dictionary blob, Date timestamp, uint16_t method, uint16_t respCode,
+                                                    uint16_t eventID, uint32_t flag) {
   QueueState before = queueState();
   if (before.state == TelvaneBackendStateDisabled) return std::nullopt;
   const EventNumbers numbers{.method = method, .respCode = respCode, .eventID = eventID};
-  Dictionary event = newEventDictFromPayload(blob, timestamp, numbers, std::move(before.sessionID));
-  prepareEvent(event, blob);
+  const Value sharedData = blob[kTelvaneMessageBlobSharedData];
+  Dictionary event = newEventDictFromPayload(std::move(blob), timestamp, numbers, std::move(before.sessionID));
+  prepareEvent(event, sharedData);
   if (isPromoting(flag) && before.state == TelvaneBackendStateSampledOut) setState(TelvaneBackendStateEnabled);
   log().message("HTTPSPostBackend(sendMessage): realtime is {}", static_cast<int>(isRealtime(flag)));
   if (flag == kPeriodicReportFlag && _context.isInternalBuild()) {
@@ -88,14 +89,14 @@ HTTPSPostBackend::QueueState HTTPSPostBackend::queueState() const {
   return result;
 }
 
-Dictionary HTTPSPostBackend::newEventDictFromPayload(const Dictionary& blob, Date timestamp,
-                                                     const EventNumbers& numbers, Value sessionID) {
-  const Value& clientData = blob[kTelvaneMessageBlobClientData];
-  const Dictionary* payload = clientData.isPresent() ? clientData.dictionary() : &blob;
+Dictionary HTTPSPostBackend::newEventDictFromPayload(Dictionary blob, Date timestamp, const EventNumbers& numbers,
+                                                     Value sessionID) {
+  Value clientData = blob.take(kTelvaneMessageBlobClientData);
+  Dictionary* payload = clientData.isPresent() ? clientData.dictionary() : &blob;
   if (payload == nullptr) {
     log().error("HTTPSPostBackend(sendMessage): SESSION_TYPE_STOP message dictionary is nil");
   }
-  Dictionary event = payload != nullptr ? *payload : Dictionary();
+  Dictionary event = payload != nullptr ? std::move(*payload) : Dictionary();
   event.reserve(event.size() + kOwnEntries + (_userInfoDict.has_value() ? _userInfoDict->size() : 0));
   if (isSessionStop(numbers.method, numbers.respCode)) addSessionStopEntries(event);
 
@@ -136,11 +137,9 @@ void HTTPSPostBackend::addDeviceEntries(Dictionary& event) const {
   event.set(kEventReportVers, selfVersionText());
 }
 
-void HTTPSPostBackend::prepareEvent(Dictionary& event, const Dictionary& blob) const {
+void HTTPSPostBackend::prepareEvent(Dictionary& event, const Value& sharedData) const {
   if (_userInfoDict.has_value()) event.addEntriesFrom(*_userInfoDict);
-  if (const Dictionary* sharedData = blob[kTelvaneMessageBlobSharedData].dictionary()) {
-    event.addEntriesFrom(*sharedData);
-  }
+  if (const Dictionary* entries = sharedData.dictionary()) event.addEntriesFrom(*entries);
 }
 
 // Time zones change at whole minutes, so the system is asked once for the events of a minute.

@@ -24,10 +24,16 @@ BackendKind kindForName(const ProcessContext& context, std::string_view name) {
   return kind == BackendKind::VDR && isDesktop(context) ? BackendKind::Unknown : kind;
 }
 
+// Asked twice for each event, so that the usual kind of entry is read in place.
+bool isEntryFor(const Value& entry, uint16_t method) noexcept {
+  const std::optional<int64_t> number = entry.integer();
+  return (number ? static_cast<int32_t>(*number) : entry.int32Value()) == method;
+}
+
 bool hasEntryFor(const Value& list, uint16_t method) noexcept {
   const Array* entries = list.array();
   return entries != nullptr && std::any_of(entries->begin(), entries->end(),
-                                           [method](const Value& entry) { return entry.int32Value() == method; });
+                                           [method](const Value& entry) { return isEntryFor(entry, method); });
 }
 
 }  // namespace
@@ -108,13 +114,13 @@ uint32_t TelvaneBackend::updateState() {
   return TelvaneBackendStateEnabled;
 }
 
-std::optional<String> TelvaneBackend::sendMessage(const Dictionary&, Date, uint16_t, uint16_t, uint16_t, uint32_t) {
+std::optional<String> TelvaneBackend::sendMessage(Dictionary, Date, uint16_t, uint16_t, uint16_t, uint32_t) {
   return std::nullopt;
 }
 
-std::optional<String> TelvaneBackend::sendMessage(const Dictionary& blob, Date timestamp, uint16_t method,
-                                                  uint16_t respCode, uint32_t flag) {
-  return sendMessage(blob, timestamp, method, respCode, ++_eventID, flag);
+std::optional<String> TelvaneBackend::sendMessage(Dictionary blob, Date timestamp, uint16_t method, uint16_t respCode,
+                                                  uint32_t flag) {
+  return sendMessage(std::move(blob), timestamp, method, respCode, ++_eventID, flag);
 }
 
 void TelvaneBackend::setStartTimestamp(Date timestamp) {

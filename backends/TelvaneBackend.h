@@ -59,12 +59,12 @@ class TelvaneBackend : public std::enable_shared_from_this<TelvaneBackend> {
   void setState(uint32_t state);
   // Decides the state anew and returns it.
   virtual uint32_t updateState();
-  // Takes one event. blob: see kTelvaneMessageBlob keys. Returns a text for the message log, or nothing.
-  virtual std::optional<String> sendMessage(const Dictionary& blob, Date timestamp, uint16_t method, uint16_t respCode,
+  // Takes one event. blob: see kTelvaneMessageBlob keys; given away, its payload becomes the event without a copy.
+  // Returns a text for the message log, or nothing.
+  virtual std::optional<String> sendMessage(Dictionary blob, Date timestamp, uint16_t method, uint16_t respCode,
                                             uint16_t eventID, uint32_t flag);
   // The same with the backend's next event number (the first is 1; wraps at 65536).
-  std::optional<String> sendMessage(const Dictionary& blob, Date timestamp, uint16_t method, uint16_t respCode,
-                                    uint32_t flag);
+  std::optional<String> sendMessage(Dictionary blob, Date timestamp, uint16_t method, uint16_t respCode, uint32_t flag);
   void setStartTimestamp(Date timestamp);
   // completion may be empty; it is called at most once, from any thread.
   virtual std::optional<String> flushMessagesWithCompletion(FlushCompletion completion);

@@ -52,6 +52,11 @@ void Array::replace(size_t index, Value value) {
   writable(size()).begin()[index] = std::move(value);
 }
 
+Value Array::take(size_t index) {
+  if (index >= size()) return {};
+  return std::exchange(writable(size()).begin()[index], Value());
+}
+
 const Value* Array::begin() const noexcept { return _storage == nullptr ? nullptr : _storage->begin(); }
 
 const Value* Array::end() const noexcept { return begin() + size(); }

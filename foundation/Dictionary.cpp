@@ -76,6 +76,14 @@ bool Dictionary::remove(std::string_view key) {
   return true;
 }
 
+Value Dictionary::take(const Key& key) {
+  const uint32_t position = _storage == nullptr ? DictionaryStorage::kNotFound : _storage->find(key, key.hash());
+  if (position == DictionaryStorage::kNotFound) return {};
+  Value value = std::move(writable(size()).begin()[position].value);
+  _storage->removeAt({&position, 1});
+  return value;
+}
+
 void Dictionary::addEntriesFrom(const Dictionary& other) {
   if (other.empty() || other._storage == _storage) return;
   if (empty()) {

@@ -52,6 +52,8 @@ class TELVANE_EXPORT Array {
   void append(Value value);
   // Replaces the value at the index. REQUIRES: index < size().
   void replace(size_t index, Value value);
+  // Returns the value at the index and leaves an absent one there; nothing is copied when this is the only owner.
+  Value take(size_t index);
   const Value* begin() const noexcept;
   const Value* end() const noexcept;
 
@@ -98,6 +100,8 @@ class TELVANE_EXPORT Dictionary {
   // Removes the key; the order of the others stays. Returns whether it was there. Takes time in proportion to the
   // size; to remove many, use keepIf.
   bool remove(std::string_view key);
+  // Removes the key and returns its value, or an absent one; nothing is copied when this is the only owner.
+  Value take(const Key& key);
   // Sets all entries of the other dictionary, replacing equal keys.
   void addEntriesFrom(const Dictionary& other);
   // Keeps only the entries for which keep(entry key, entry value) is true. Asks once for each entry, in order.
@@ -190,6 +194,8 @@ class TELVANE_EXPORT Value {
   const telvane::Date* date() const noexcept { return _kind == Kind::Date ? &_date : nullptr; }
   const telvane::Array* array() const noexcept { return _kind == Kind::Array ? &_array : nullptr; }
   const telvane::Dictionary* dictionary() const noexcept { return _kind == Kind::Dictionary ? &_dictionary : nullptr; }
+  // The same, to be changed or moved from.
+  telvane::Dictionary* dictionary() noexcept { return _kind == Kind::Dictionary ? &_dictionary : nullptr; }
   // Only of Kind::Boolean.
   std::optional<bool> boolean() const noexcept {
     return _kind == Kind::Boolean ? std::optional(_raw.first != 0) : std::nullopt;

@@ -86,7 +86,7 @@ struct Reply {
   # True when the receiver let the call go unanswered; the caller's error handler then stands for the answer.
 
   values @2 :List(Value);
-  # What the reply block receives, in its order. Empty when dropped.
+  # What the reply block receives, in its order; values missing at the end count as absent. Empty when dropped.
 }
 
 interface Acceptor {

@@ -5,9 +5,9 @@
 namespace telvane {
 namespace {
 
-Dictionary dictionaryOrEmpty(const Value& value) {
-  const Dictionary* dictionary = value.dictionary();
-  return dictionary != nullptr ? *dictionary : Dictionary();
+Dictionary dictionaryOrEmpty(Value value) {
+  Dictionary* dictionary = value.dictionary();
+  return dictionary != nullptr ? std::move(*dictionary) : Dictionary();
 }
 
 Array arrayOrEmpty(const Value& value) {
@@ -28,6 +28,13 @@ UniqueFunction<void(T)> singleReply(ipc::ReplyBlock reply) {
   };
 }
 
+// What a backend returned for a message is mostly nothing, which a reply without values says for less.
+MessageReply messageReply(ipc::ReplyBlock reply) {
+  return [reply = std::move(reply)](Value result) mutable {
+    if (reply) reply(result.isPresent() ? Array{std::move(result)} : Array());
+  };
+}
+
 }  // namespace
 
 ClientSessionDispatcher::ClientSessionDispatcher(Log& log, std::shared_ptr<ClientSessionInterface> session,
@@ -35,7 +42,7 @@ ClientSessionDispatcher::ClientSessionDispatcher(Log& log, std::shared_ptr<Clien
     : _log(log), _session(std::move(session)), _status(std::move(status)) {}
 
 void ClientSessionDispatcher::invoke(ipc::Invocation invocation, ipc::ReplyBlock reply) {
-  const Array& arguments = invocation.arguments;
+  Array& arguments = invocation.arguments;
   switch (static_cast<ClientSessionOperation>(invocation.operation)) {
     case ClientSessionOperation::SetSessionInfo:
       return _session->setSessionInfo(dictionaryOrEmpty(arguments[0]), arguments[1], arguments[2],
@@ -47,7 +54,7 @@ void ClientSessionDispatcher::invoke(ipc::Invocation invocation, ipc::ReplyBlock
     case ClientSessionOperation::FetchDisplayURL:
       return _session->fetchDisplayURL(singleReply<String>(std::move(reply)));
     case ClientSessionOperation::SendMessageWithDictionary:
-      return _session->sendMessageWithDictionary(dictionaryOrEmpty(arguments[0]), singleReply<Value>(std::move(reply)));
+      return _session->sendMessageWithDictionary(dictionaryOrEmpty(arguments.take(0)), messageReply(std::move(reply)));
     case ClientSessionOperation::FlushMessages:
       return _session->flushMessagesWithCompletion(
           [reply = std::move(reply)](Value result, std::optional<Error> error) mutable {

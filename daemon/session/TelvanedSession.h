@@ -124,8 +124,8 @@ class TelvanedSession : public ClientSessionInterface, public std::enable_shared
   const std::shared_ptr<TelvaneBackend>* backendNamed(std::string_view name) const;
 
   // Messages.
-  Value sendMessageToBackends(const Dictionary& message);
-  Dictionary messageBlob(const Value& payload);
+  Value sendMessageToBackends(Dictionary message);
+  Dictionary messageBlob(Value payload);
   bool isDropped(const TelvaneBackend& backend, uint16_t category, std::string_view operation) const;
   void internalSendMessage(const Value& payload, uint16_t method, uint16_t respCode);
   void internalFlushMessagesWithCompletion(FlushReply completion);

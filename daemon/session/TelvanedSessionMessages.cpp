@@ -40,11 +40,11 @@ struct FlushCountdown {
 
 void TelvanedSession::sendMessageWithDictionary(Dictionary message, MessageReply reply) {
   log().message("sendMessageWithDictionary: Sending message for session {}", _sessionID);
-  Value result = sendMessageToBackends(message);
+  Value result = sendMessageToBackends(std::move(message));
   if (reply) reply(std::move(result));
 }
 
-Value TelvanedSession::sendMessageToBackends(const Dictionary& message) {
+Value TelvanedSession::sendMessageToBackends(Dictionary message) {
   if (!_backends.has_value() || _backends->empty()) {
     log().message("sendMessageWithDictionary: No backends available to send message");
     return {};
@@ -59,17 +59,21 @@ Value TelvanedSession::sendMessageToBackends(const Dictionary& message) {
   const uint16_t category = categoryValue.low16Bits();
   const uint16_t type = typeValue.low16Bits();
   const uint32_t flag = message[kTelvaneMessageParametersFlag].uint32Value();
+  Value payload = message.take(kTelvaneMessageParametersPayload);
   // A payload of another kind than the one agreed counts as none.
-  const Value& given = message[kTelvaneMessageParametersPayload];
-  const Value& payload = given.isDictionary() ? given : Value::none();
+  if (!payload.isDictionary()) payload = {};
   const Date now = _context.platform().clock.now();
   aggregateMessage(now.secondsSince1970(), category, type, payload);
 
-  const Dictionary blob = messageBlob(payload);
+  Dictionary blob = messageBlob(std::move(payload));
+  size_t backendsLeft = _backends->size();
   Value chosen;
   for (const auto& [name, backend] : *_backends) {
+    --backendsLeft;
     if (isDropped(*backend, category, "sendMessageWithDictionary")) continue;
-    std::optional<String> result = backend->sendMessage(blob, now, category, type, flag);
+    // The last one, which is most often the only one, may have the payload for its own.
+    std::optional<String> result =
+        backend->sendMessage(backendsLeft == 0 ? std::move(blob) : blob, now, category, type, flag);
     if (!result.has_value()) continue;
     _shared.messageLog.writeToLogFile("[{} -> sendMessageWithDictionary] {}", name, *result);
     if (isHTTPSPostName(name) || (name == kTelvaneBackendDashboard.view() && !chosen.isPresent())) {
@@ -93,7 +97,7 @@ bool TelvanedSession::isDropped(const TelvaneBackend& backend, uint16_t category
   return false;
 }
 
-Dictionary TelvanedSession::messageBlob(const Value& payload) {
+Dictionary TelvanedSession::messageBlob(Value payload) {
   Dictionary blob;
   // Without a hierarchy there is nothing shared, and no lock to take for it.
   if (_hierarchyDictionary.has_value()) {
@@ -102,7 +106,7 @@ Dictionary TelvanedSession::messageBlob(const Value& payload) {
       blob.set(kTelvaneMessageBlobSharedData, *std::move(sharedData));
     }
   }
-  if (payload.isPresent()) blob.set(kTelvaneMessageBlobClientData, payload);
+  if (payload.isPresent()) blob.set(kTelvaneMessageBlobClientData, std::move(payload));
   return blob;
 }
 
@@ -110,7 +114,7 @@ void TelvanedSession::internalSendMessage(const Value& payload, uint16_t method,
   Dictionary message{{kTelvaneMessageParametersCategory, method}, {kTelvaneMessageParametersType, respCode}};
   message.set(kTelvaneMessageParametersPayload, payload);
   message.set(kTelvaneMessageParametersFlag, Value(0));
-  sendMessageToBackends(message);
+  sendMessageToBackends(std::move(message));
   log().message("internalSendMessage: Sent internal message (method:{} respCode:{})", method, respCode);
 }
 

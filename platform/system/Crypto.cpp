@@ -88,7 +88,12 @@ Data contentOf(BIO* bio) {
 
 SHA1Digest sha1(std::span<const uint8_t> bytes) { return digest<SHA1Digest>(EVP_sha1(), bytes); }
 
-SHA256Digest sha256(std::span<const uint8_t> bytes) { return digest<SHA256Digest>(EVP_sha256(), bytes); }
+SHA256Digest sha256(std::span<const uint8_t> bytes) {
+  // Fetched once: to look the algorithm up costs more than to digest a short text with it.
+  static const EVP_MD* const algorithm = EVP_MD_fetch(nullptr, "SHA256", nullptr);
+  require(algorithm != nullptr);
+  return digest<SHA256Digest>(algorithm, bytes);
+}
 
 SHA1Digest hmacSHA1(std::span<const uint8_t> key, std::span<const uint8_t> bytes) {
   return hmac<SHA1Digest>(EVP_sha1(), key, bytes);

@@ -14,10 +14,10 @@ class PlainBackend final : public TelvaneBackend {
   explicit PlainBackend(const ProcessContext& context) : TelvaneBackend(context, "plain", Dictionary(), "TelvaneBox") {}
 
   using TelvaneBackend::sendMessage;
-  std::optional<String> sendMessage(const Dictionary& blob, Date timestamp, uint16_t method, uint16_t respCode,
+  std::optional<String> sendMessage(Dictionary blob, Date timestamp, uint16_t method, uint16_t respCode,
                                     uint16_t eventID, uint32_t flag) override {
     lastEventID = eventID;
-    return TelvaneBackend::sendMessage(blob, timestamp, method, respCode, eventID, flag);
+    return TelvaneBackend::sendMessage(std::move(blob), timestamp, method, respCode, eventID, flag);
   }
   void setLists(Value whitelist, Value blacklist) {
     _eventWhitelist = std::move(whitelist);
