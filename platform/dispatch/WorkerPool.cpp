@@ -41,9 +41,16 @@ void WorkerPool::submit(Job job) {
     MutexLock lock(_mutex);
     _jobs.push_back(std::move(job));
     _waitingCount.store(_jobs.size(), std::memory_order_relaxed);
-    sleeper = engage();
+    const bool isTaken = callerTakesJob();
+    if (isTaken) ++_jobsLeftToCaller;
+    sleeper = engage(isTaken);
   }
   wake(sleeper);
+}
+
+bool WorkerPool::callerTakesJob() const {
+  const Current& caller = current();
+  return caller.pool == this && caller.worker->state == State::Running && _jobs.size() == 1;
 }
 
 size_t WorkerPool::workerCount() const {
@@ -51,8 +58,8 @@ size_t WorkerPool::workerCount() const {
   return _workerCount;
 }
 
-WorkerPool::Worker* WorkerPool::engage() {
-  const bool mayRun = _runners < _options.concurrency;
+WorkerPool::Worker* WorkerPool::engage(bool isTaken) {
+  const bool mayRun = !isTaken && _runners < _options.concurrency;
   if (_jobs.empty() || (!mayRun && _isWatched)) return nullptr;
   const State state = mayRun ? State::Running : State::Watching;
   Worker* sleeper = takeIdle();
@@ -137,12 +144,15 @@ void WorkerPool::runJob(Worker& worker) {
 }
 
 void WorkerPool::watch(Worker& worker) {
-  while (!_jobs.empty()) {
+  uint64_t left = 0;
+  // One watch serves all jobs that are left to their callers meanwhile: under load none of them wakes a thread.
+  while (!_jobs.empty() || left != _jobsLeftToCaller) {
     const uint64_t taken = _jobsTaken;
-    const auto deadline = deadlineAfter(kStallTime);
+    left = _jobsLeftToCaller;
+    const auto deadline = deadlineAfter(_runners < _options.concurrency ? kHandOverTime : kStallTime);
     while (worker.wake.waitUntil(_mutex, deadline)) {
     }
-    if (_jobs.empty()) break;
+    if (_jobs.empty()) continue;
     if (_jobsTaken == taken && _runners >= _options.concurrency) setAsideLongestRunning();
     if (_runners < _options.concurrency) {
       worker.state = State::Running;
