@@ -108,5 +108,28 @@ TEST(ArrayTest, comparesElementByElement) {
   EXPECT_EQ(Array(), Array{});
 }
 
+TEST(ArrayTest, givesAnElementAwayAndKeepsItsPlace) {
+  Array array{1, "two", 3};
+  EXPECT_EQ(array.take(1), Value("two"));
+  EXPECT_EQ(array, (Array{1, Value(), 3}));
+  EXPECT_FALSE(array.take(3).isPresent());
+}
+
+TEST(ArrayTest, leavesOtherOwnersWhatItGivesAway) {
+  Array array{1, "two"};
+  const Array other = array;
+  EXPECT_EQ(array.take(1), Value("two"));
+  EXPECT_EQ(other, (Array{1, "two"}));
+}
+
+TEST(ArrayTest, costsOneAllocationWithItsElements) {
+  EXPECT_EQ(allocationsDuring([] {
+              Array array;
+              array.reserve(40);
+              for (int i = 0; i < 40; ++i) array.append(i);
+            }),
+            1u);
+}
+
 }  // namespace
 }  // namespace telvane::testing

@@ -319,5 +319,51 @@ TEST(DictionaryTest, staysFastWhenEveryHashIsTheSame) {
   EXPECT_LT(crafted, ordinary * 10) << ordinary << " s for ordinary keys, " << crafted << " s for colliding ones";
 }
 
+TEST(DictionaryTest, givesAValueAwayWithItsKey) {
+  Dictionary dictionary{{Key("a"), 1}, {Key("b"), "two"}, {Key("c"), 3}};
+  EXPECT_EQ(dictionary.take(Key("b")), Value("two"));
+  EXPECT_EQ(dictionary, (Dictionary{{Key("a"), 1}, {Key("c"), 3}}));
+  EXPECT_FALSE(dictionary.take(Key("b")).isPresent());
+}
+
+TEST(DictionaryTest, leavesOtherOwnersWhatItGivesAway) {
+  Dictionary dictionary{{Key("a"), 1}, {Key("b"), "two"}};
+  const Dictionary other = dictionary;
+  EXPECT_EQ(dictionary.take(Key("b")), Value("two"));
+  EXPECT_EQ(other, (Dictionary{{Key("a"), 1}, {Key("b"), "two"}}));
+}
+
+TEST(DictionaryTest, givesASoleOwnersContainerAwayWithoutACopy) {
+  Dictionary dictionary{{Key("payload"), Dictionary{{Key("n"), 1}}}};
+  EXPECT_EQ(allocationsDuring([&] {
+              Value payload = dictionary.take(Key("payload"));
+              payload.dictionary()->set(Key("n"), 2);
+            }),
+            0u);
+}
+
+TEST(DictionaryTest, costsOneAllocationWithItsEntries) {
+  EXPECT_EQ(allocationsDuring([] {
+              Dictionary dictionary;
+              dictionary.reserve(3);
+              dictionary.set(Key("a"), 1);
+              dictionary.set(Key("b"), 2);
+              dictionary.set(Key("c"), 3);
+            }),
+            1u);
+}
+
+// A key is looked for among the others only when its hash could be there; removing keys must not mislead that.
+TEST(DictionaryTest, findsAllThatIsThereAfterRemovalsAndGrowth) {
+  Dictionary dictionary;
+  for (int i = 0; i < 60; ++i) dictionary.set(String("key " + std::to_string(i)), i);
+  dictionary.keepIf([](const String&, const Value& value) { return value.integerValue() % 3 != 0; });
+  for (int i = 60; i < 90; ++i) dictionary.set(String("key " + std::to_string(i)), i);
+  for (int i = 0; i < 90; ++i) {
+    const bool isThere = i >= 60 || i % 3 != 0;
+    EXPECT_EQ(dictionary["key " + std::to_string(i)], isThere ? Value(i) : Value()) << i;
+  }
+}
+
 }  // namespace
 }  // namespace telvane::testing

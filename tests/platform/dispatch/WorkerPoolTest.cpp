@@ -4,6 +4,7 @@
 #include <pthread.h>
 
 #include <csignal>
+#include <functional>
 #include <future>
 #include <thread>
 #include <vector>
@@ -52,6 +53,47 @@ TEST(WorkerPoolTest, makesProgressWithMoreWaitsThatNobodyAnnouncedThanCores) {
   }
   pool.submit([&mayGoOn] { mayGoOn.set_value(); });
   for (unsigned i = 0; i < kJobs; ++i) ASSERT_TRUE(done->waitFor(kDeadline)) << "after " << i << " jobs";
+}
+
+// A job that a running job submits is left for the same worker, which may never come to it.
+TEST(WorkerPoolTest, runsAJobThatTheSubmittingJobWaitsForWithoutSayingSo) {
+  WorkerPool pool;
+  const auto done = std::make_shared<ThreadedSemaphore>(0);
+  pool.submit([&pool, done] {
+    std::promise<void> inner;
+    pool.submit([&inner] { inner.set_value(); });
+    inner.get_future().wait();
+    done->signal();
+  });
+  EXPECT_TRUE(done->waitFor(kDeadline));
+}
+
+TEST(WorkerPoolTest, runsAJobThatTheSubmittingJobAnnouncesToWaitFor) {
+  WorkerPool pool;
+  const auto done = std::make_shared<ThreadedSemaphore>(0);
+  pool.submit([&pool, done] {
+    const auto inner = std::make_shared<ThreadedSemaphore>(0);
+    pool.submit([inner] { inner->signal(); });
+    inner->wait();
+    done->signal();
+  });
+  EXPECT_TRUE(done->waitFor(kDeadline));
+}
+
+TEST(WorkerPoolTest, runsAChainOfJobsThatHandOverToOneAnother) {
+  constexpr int kLinks = 1000;
+  WorkerPool pool;
+  const auto done = std::make_shared<ThreadedSemaphore>(0);
+  int left = kLinks;  // each link runs after the one before it
+  std::function<void()> link = [&] {
+    if (--left == 0) {
+      done->signal();
+    } else {
+      pool.submit([&link] { link(); });
+    }
+  };
+  pool.submit([&link] { link(); });
+  EXPECT_TRUE(done->waitFor(kDeadline)) << left << " links are left";
 }
 
 TEST(WorkerPoolTest, hasNoMoreThreadsThanAllowedAndRefusesNoJob) {
