@@ -111,6 +111,7 @@ class TelvanedSession : public ClientSessionInterface, public std::enable_shared
   void returnTransactionHold();
 
   // Configuration.
+  void setSessionID(const Dictionary& sessionInfo);
   void setHierarchyFromSessionInfo();
   void updateUserInfo(Value userInfo);
   void releaseUserInfo();
@@ -157,7 +158,6 @@ class TelvanedSession : public ClientSessionInterface, public std::enable_shared
 
   // Confined to the connection's queue.
   std::shared_ptr<TelvanedSessionDelegate> _sessionDelegate;
-  uint32_t _sessionID = 0;
   Value _userInfo;
   Value _frameworks;
   std::optional<Value> _storebagVersion;
@@ -169,6 +169,7 @@ class TelvanedSession : public ClientSessionInterface, public std::enable_shared
 
   // Written on the connection's queue; read by other sessions of the hierarchy under the agent's lock, which is
   // therefore also held to write them once the session is listed.
+  uint32_t _sessionID = 0;
   Value _sessionInfo;
   std::optional<Dictionary> _hierarchyDictionary;
   std::optional<BackendTable> _backends;

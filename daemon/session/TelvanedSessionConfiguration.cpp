@@ -28,7 +28,7 @@ void TelvanedSession::setSessionInfo(Dictionary sessionInfo, Value userInfo, Val
     _sessionInfo = sessionInfo;
   }
   if (_sessionDelegate->isActiveClientLimitReachedForSession(*this, _sessionInfo)) return;
-  _sessionID = sessionInfo[kTelvaneSessionInfoSessionID].uint32Value();
+  setSessionID(sessionInfo);
   log().message("setSessionInfo: Configuring session {}", _sessionID);
   if (userInfo.isPresent() && !sessionInfo[kTelvaneSessionInfoRequireUserInfo].booleanValue()) {
     log().error("setSessionInfo: Configure session: user info provided without requiring it");
@@ -38,6 +38,11 @@ void TelvanedSession::setSessionInfo(Dictionary sessionInfo, Value userInfo, Val
   _frameworks = std::move(frameworksToCheck);
   updateUserInfo(std::move(userInfo));
   _hasAggregator = hasAggregationBlock;
+}
+
+void TelvanedSession::setSessionID(const Dictionary& sessionInfo) {
+  MonitorLock lock(_sessionDelegate->monitor());
+  _sessionID = sessionInfo[kTelvaneSessionInfoSessionID].uint32Value();
 }
 
 void TelvanedSession::setHierarchyFromSessionInfo() {
@@ -136,6 +141,8 @@ void TelvanedSession::createBackendsWithStorebag(const Dictionary& storebag) {
   const Value& releaseTimeout = storebag[kStorebagReleaseTimeout];
   _connectivityHelperReleaseTimeout =
       releaseTimeout.isPresent() ? releaseTimeout.uint32Value() : kDefaultReleaseTimeout;
+  // A message without a configured session may come in the midst of one; what that one's backends hold goes out first.
+  if (_backends.has_value() && !_backends->empty()) internalFlushMessagesWithCompletion(nullptr);
   std::optional<BackendTable> backends = createBackends(_context, storebag, _sessionInfo, _userInfo, _deviceid);
   if (backends.has_value()) {
     for (const auto& [name, backend] : *backends) {

@@ -75,7 +75,7 @@ void TelvanedSession::sendMessageWithSessionInfo(Dictionary sessionInfo, Value u
     reply("Could not retrieve identifiers from sessionInfo");
     return;
   }
-  _sessionID = sessionInfo[kTelvaneSessionInfoSessionID].uint32Value();
+  setSessionID(sessionInfo);
   setHierarchyFromSessionInfo();
   _sessionDelegate->updateCorrelatedSessions(*this);
   log().message("sendMessageWithSessionInfo: Sending message with session info for session {}", _sessionID);

@@ -1,4 +1,8 @@
 // The health report that a stop message carries.
+#include <algorithm>
+#include <set>
+
+#include "interfaces/ClientTypes.h"
 #include "interfaces/HealthKeys.h"
 #include "tests/daemon/DaemonFixture.h"
 
@@ -31,6 +35,33 @@ TEST_F(TelvanedSessionHealthTest, sessionsWithoutAKnownTypeCountAsUnknown) {
   ending->close();
   EXPECT_THAT(lastStop(), HasEntry("SessionsCount_Unknown", 1));
   EXPECT_THAT(lastStop(), HasEntry("BatchSize_Unknown", 0));
+}
+
+TEST_F(TelvanedSessionHealthTest, aSessionThatNamesATypeThatIsNoneCountsAsUnknown) {
+  givenStorebag();
+  auto ending = startSession();
+  ending->setSessionInfo(sessionInfo(40), userInfo());
+  ending->close();
+  EXPECT_THAT(lastStop(), HasEntry("SessionsCount_Unknown", 1));
+  EXPECT_TRUE(lastStop().contains("BatchSize_Unknown"));
+  EXPECT_FALSE(lastStop().contains("SessionsCount_MEDIA"));
+}
+
+TEST_F(TelvanedSessionHealthTest, eachClientTypeHasAShortNameOfItsOwn) {
+  std::set<std::string_view> names;
+  for (const ClientType& row : allClientTypes()) {
+    names.insert(row.senderName);
+    EXPECT_TRUE(std::all_of(row.senderName.begin(), row.senderName.end(), [](char c) { return c >= 'A' && c <= 'Z'; }))
+        << row.senderName;
+  }
+  EXPECT_EQ(names.size(), 26u);
+}
+
+TEST_F(TelvanedSessionHealthTest, withoutMemoryFiguresTheProcessUsesNone) {
+  givenStorebag();
+  process.processMemory().set(0);
+  startSession()->close();
+  EXPECT_EQ(lastStop()[kHealthProcessMemoryUsage], Value(0));
 }
 
 TEST_F(TelvanedSessionHealthTest, sumsWhatWaitsInBatches) {

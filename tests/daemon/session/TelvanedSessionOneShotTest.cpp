@@ -63,6 +63,43 @@ TEST_F(TelvanedSessionOneShotTest, withoutASessionIDIsRefused) {
   EXPECT_EQ(statusOf(sendOne(info, userInfo())), "Could not retrieve identifiers from sessionInfo");
 }
 
+TEST_F(TelvanedSessionOneShotTest, withoutAClientTypeIsCutOff) {
+  log().expectError("missing clientType in its sessionInfo ");
+  Dictionary info = sessionInfo();
+  info.remove(kTelvaneSessionInfoClientType.view());
+  const std::string status = statusOf(sendOne(info, userInfo()));
+  EXPECT_TRUE(status.starts_with("Exceeded maximum active reporting session limit for userInfo='{")) << status;
+  EXPECT_TRUE(client->isInvalidated());
+}
+
+TEST_F(TelvanedSessionOneShotTest, isFiledInItsHierarchyButNeitherAggregatedNorGivenWhatThatShares) {
+  givenStorebag();
+  const auto root = startSession(sessionInfoIn("a", 0, 1), userInfo(), true);
+  root->tell(ClientSessionOperation::UpdateSharedDataForKey, {"shared", 1});
+  const size_t before = root->aggregated().size();
+  EXPECT_EQ(statusOf(sendOne(sessionInfoIn("a", 1, 2), userInfo(), Dictionary{{Key("k"), 1}})), "finished");
+  EXPECT_EQ(root->aggregated().size(), before);
+  EXPECT_TRUE(
+      hasLine(log(), "updateCorrelatedSessions: Adding session 2 to list for hierarchyToken a with hierarchyLevel 1"));
+  client->close();
+  ASSERT_EQ(postedEvents(7, 2).size(), 1u);
+  EXPECT_THAT(postedEvents(7, 2)[0], HasEntry("k", 1));
+  EXPECT_FALSE(postedEvents(7, 2)[0].contains("shared"));
+  EXPECT_EQ(sessions().size(), 1u);
+}
+
+TEST_F(TelvanedSessionOneShotTest, inTheMidstOfASessionLosesNothingThatWaits) {
+  givenStorebag();
+  client = startSession();
+  client->send(8);
+  EXPECT_EQ(statusOf(client->sendOneMessage(sessionInfo(), userInfo())), "finished");
+  EXPECT_EQ(statusOf(client->sendOneMessage(sessionInfo(), userInfo())), "finished");
+  client->close();
+  EXPECT_EQ(postedEvents(8, 1).size(), 1u);
+  EXPECT_EQ(postedEvents(7, 2).size(), 2u);
+  EXPECT_TRUE(hasLines(log(), 1, "got incremented to")) << "a session counts once";
+}
+
 TEST_F(TelvanedSessionOneShotTest, withoutAStorebagIsRefused) {
   log().allowErrors();
   givenDefault(kTelvaneDefaultsSuite, kDefaultsStorebagURL, "https://bags.example");
