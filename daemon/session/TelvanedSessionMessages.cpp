@@ -148,6 +148,8 @@ void TelvanedSession::sendToAggregator(const Value& sessionInfo, double timestam
   ipc::Invocation invocation;
   invocation.operation = static_cast<uint16_t>(ClientSessionReplyOperation::SendMessageToClient);
   invocation.arguments = {sessionInfo, Value(timestamp), Value(category), Value(type), payload};
+  // A client that does not read loses the newest; a notice and a log line for each would cost more than the message.
+  invocation.isDroppedSilently = true;
   connection->send(std::move(invocation), [&log = log()](const Error& error) {
     log.message("sendMessageWithDictionary: Failed to get remote object proxy: {}", error);
   });
