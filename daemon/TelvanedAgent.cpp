@@ -2,6 +2,7 @@
 #include "daemon/TelvanedAgent.h"
 
 #include <algorithm>
+#include <limits>
 
 #include "interfaces/SessionKeys.h"
 
@@ -85,18 +86,16 @@ void TelvanedAgent::invalidateReportingSession(TelvanedSession& session) {
   uncount(session);
 }
 
+// It may stand under another token than the one that it has now: a client that gives its hierarchy up is not filed
+// anew. Hierarchies that were left empty go, too, or a client could make as many as it likes.
 void TelvanedAgent::forgetCorrelation(TelvanedSession& session) {
-  const std::optional<String> token = session.hierarchyToken();
-  if (!token.has_value()) return;
-  const auto found = _correlatedSessions.find(token->str());
-  if (found == _correlatedSessions.end()) return;
-  std::erase_if(found->second, [&session](const auto& weak) {
-    const auto listed = weak.lock();
-    return listed == nullptr || listed.get() == &session;
-  });
-  if (!found->second.empty()) return;
-  _sharedData.erase(found->first);
-  _correlatedSessions.erase(found);
+  for (auto& [anyToken, list] : _correlatedSessions) {
+    std::erase_if(list, [&session](const auto& weak) {
+      const auto listed = weak.lock();
+      return listed == nullptr || listed.get() == &session;
+    });
+  }
+  forgetEmptyHierarchies();
 }
 
 void TelvanedAgent::uncount(TelvanedSession& session) {
@@ -145,8 +144,11 @@ bool TelvanedAgent::isActiveClientLimitReachedForSession(TelvanedSession& sessio
         "{}. Session terminated...",
         session.sessionID(), clientTypeValue);
   }
-  ++counter;
-  session.setCountedClientType(static_cast<int32_t>(clientType));
+  // Refused sessions count until they are gone. A crowd of them must not carry the counter past its largest value to 0.
+  if (counter < std::numeric_limits<uint8_t>::max()) {
+    ++counter;
+    session.setCountedClientType(static_cast<int32_t>(clientType));
+  }
   log().info("isActiveClientLimitReachedForSession: active session count for clientType {} got incremented to {}",
              clientType, counter);
   if (isRefused) session.invalidate();

@@ -82,10 +82,14 @@ class TelvanedAgent : public TelvanedSessionDelegate,
 
   // One counter per client type, those without a storebag included.
   static constexpr size_t kClientTypeCounters = 31;
+  // How many hierarchies that sessions have left for another one are kept.
+  static constexpr size_t kMaximumEmptyHierarchies = 64;
 
   Log& log() const noexcept { return _context.log(); }
   void reportingSessionEnded();
   void forgetCorrelation(TelvanedSession& session) REQUIRES(*_monitor);
+  // Removes the hierarchies without a session, and their shared data.
+  void forgetEmptyHierarchies() REQUIRES(*_monitor);
   void uncount(TelvanedSession& session) REQUIRES(*_monitor);
   bool isListed(const CorrelatedSessions& list, const TelvanedSession& session) const;
   CorrelatedSessions* correlatedSessions(const String& token) REQUIRES(*_monitor);

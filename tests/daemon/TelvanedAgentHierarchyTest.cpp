@@ -135,6 +135,59 @@ TEST_F(TelvanedAgentHierarchyTest, theEmptyOldHierarchyStaysInTheRegistry) {
   EXPECT_TRUE(hasLine(log(), "as it has proper entitlement, 1(2) connections."));
 }
 
+TEST_F(TelvanedAgentHierarchyTest, aHierarchyThatWasLeftGoesWithItsSharedDataWhenItsSessionEnds) {
+  givenLevels({0});
+  clients[0]->tell(ClientSessionOperation::UpdateSharedDataForKey, {"k", 1});
+  clients[0]->setSessionInfo(sessionInfoIn("b", 0, 1), userInfo());
+  close(1);
+  givenLevels({0});
+  EXPECT_EQ(agent().sharedDataForSession(*kept[0]), std::nullopt);
+  EXPECT_TRUE(hasLines(log(), 2, "as it has proper entitlement, 0(0) connections."));
+}
+
+TEST_F(TelvanedAgentHierarchyTest, aSessionThatGivesItsHierarchyUpLeavesNothingBehind) {
+  givenLevels({0});
+  clients[0]->tell(ClientSessionOperation::UpdateSharedDataForKey, {"k", 1});
+  clients[0]->setSessionInfo(sessionInfo(), userInfo());
+  close(1);
+  givenLevels({0});
+  EXPECT_EQ(agent().sharedDataForSession(*kept[0]), std::nullopt);
+  EXPECT_TRUE(hasLines(log(), 2, "as it has proper entitlement, 0(0) connections."));
+}
+
+TEST_F(TelvanedAgentHierarchyTest, aSessionThatKeepsMovingFillsNoRegistry) {
+  givenLevels({0, 1});
+  constexpr int kMoves = 1000;
+  for (int i = 0; i < kMoves; ++i) {
+    clients[1]->setSessionInfo(sessionInfoIn(std::to_string(i).c_str(), 1, 2), userInfo());
+  }
+  EXPECT_LT(agent().daemonStatus()["hierarchies"].integerValue(), 100);
+  EXPECT_EQ(parentOf(2), 0u);
+  clients[1]->setSessionInfo(sessionInfoIn("a", 1, 2), userInfo());
+  EXPECT_EQ(parentOf(2), 1u) << "a hierarchy with a session stays";
+}
+
+TEST_F(TelvanedAgentHierarchyTest, aThousandSessionsOfOneHierarchyLeaveOnlyItsRoot) {
+  givenStorebag();
+  givenLevels({0}, {0});
+  clients[0]->start();
+  constexpr int kSessions = 1000;
+  for (int i = 1; i <= kSessions; ++i) {
+    auto child = startSession(sessionInfoIn("a", 1 + i % 3, static_cast<uint32_t>(i)), userInfo(), true);
+    child->tell(ClientSessionOperation::UpdateSharedDataForKey, {"last", i});
+    child->send(7);
+  }
+  EXPECT_EQ(sessions().size(), 1u);
+  EXPECT_EQ(agent().sharedDataForSession(*kept[0]), (Dictionary{{Key("last"), kSessions}}));
+  EXPECT_EQ(agent().daemonStatus()["hierarchies"], Value(1));
+  const auto isEvent = [](const Array& call) { return call[2] == Value(7); };
+  EXPECT_EQ(std::count_if(clients[0]->aggregated().begin(), clients[0]->aggregated().end(), isEvent), kSessions);
+  EXPECT_EQ(postedEvents(7, 1).size(), static_cast<size_t>(kSessions));
+  kept.clear();
+  close(1);
+  EXPECT_EQ(agent().daemonStatus()["hierarchies"], Value(0));
+}
+
 TEST_F(TelvanedAgentHierarchyTest, theHighestAggregatingAncestorWins) {
   givenLevels({0, 1, 2, 3}, {1, 2});
   EXPECT_EQ(aggregatorOf(4), 2u);
@@ -146,6 +199,37 @@ TEST_F(TelvanedAgentHierarchyTest, theHighestAggregatingAncestorWins) {
 TEST_F(TelvanedAgentHierarchyTest, aSiblingThatDoesNotStandForItsLevelDoesNotAggregate) {
   givenLevels({0, 1, 1, 2}, {2});
   EXPECT_EQ(aggregatorOf(4), 0u);
+}
+
+TEST_F(TelvanedAgentHierarchyTest, aSkippedLevelBreaksTheChainButNotTheAggregation) {
+  givenLevels({0, 2}, {0});
+  EXPECT_EQ(parentOf(2), 0u);
+  EXPECT_EQ(chainOf(2), "none");
+  EXPECT_EQ(aggregatorOf(2), 1u);
+}
+
+TEST_F(TelvanedAgentHierarchyTest, anAncestorThatComesLaterJoinsTheChainsBelow) {
+  givenStorebag();
+  givenLevels({1, 0, 2});
+  clients[2]->start();
+  clients[2]->send(7);
+  clients[1]->start();
+  clients[2]->flush();
+  EXPECT_EQ(postedEvents(7, 1).at(0)["_sessionID"], Value(idOf(2) + "." + idOf(1) + "." + idOf(3)));
+}
+
+TEST_F(TelvanedAgentHierarchyTest, anAggregatorThatClosesLetsItsOwnClientHearOfNothingMore) {
+  givenStorebag();
+  givenLevels({1, 2}, {0});
+  clients[0]->start();
+  clients[1]->start();
+  clients[1]->send(7);
+  const size_t before = clients[0]->aggregated().size();
+  EXPECT_EQ(clients[0]->aggregated().back()[2], Value(7));
+  clients.push_back(startSession(sessionInfoIn("a", 0, 3), userInfo(), true));
+  clients[1]->send(7);
+  EXPECT_EQ(clients[0]->aggregated().size(), before + 1) << "the end of aggregation";
+  EXPECT_EQ(clients[2]->aggregated().back()[2], Value(7));
 }
 
 TEST_F(TelvanedAgentHierarchyTest, onlyTheTopmostAggregatorStaysOpenAfterARefresh) {
@@ -199,6 +283,21 @@ TEST_F(TelvanedAgentHierarchyTest, anAbsurdLevelCostsNoMoreThanTheSessionsThereA
   EXPECT_EQ(chainOf(1), "none");
   EXPECT_EQ(aggregatorOf(1), 0u);
   EXPECT_EQ(parentOf(3), 0u);
+  EXPECT_EQ(chainOf(3), "none");
+  EXPECT_EQ(aggregatorOf(3), 0u);
+}
+
+TEST_F(TelvanedAgentHierarchyTest, anAbsurdLevelReportsAndAggregatesLikeAnyOther) {
+  givenStorebag();
+  givenLevels({INT32_MIN, 0, INT32_MAX, INT32_MAX - 1}, {1, 2});
+  for (const auto& client : clients) EXPECT_EQ(client->start()[0], Value(Array{"splunk"}));
+  for (const auto& client : clients) client->send(7);
+  for (const auto& client : clients) client->flush();
+  EXPECT_EQ(postedEvents(7, 1).size(), 4u);
+  EXPECT_EQ(aggregatorOf(3), 2u);
+  EXPECT_EQ(parentOf(3), 4u);
+  EXPECT_EQ(chainOf(3), idOf(4));
+  EXPECT_FALSE(kept[2]->hasAggregator());
 }
 
 }  // namespace

@@ -44,6 +44,37 @@ TEST_F(TelvanedAgentLimitsTest, aSessionIsCountedOnce) {
   EXPECT_TRUE(hasLines(log(), 1, "got incremented to"));
 }
 
+// The refused ones are counted until they have gone, which none has here.
+TEST_F(TelvanedAgentLimitsTest, aCrowdOfRefusedSessionsLetsNobodyInAndLeavesTheCountRight) {
+  constexpr size_t kCrowd = 600;
+  std::vector<std::unique_ptr<DaemonClient>> crowd;
+  for (size_t i = 0; i < kCrowd; ++i) crowd.push_back(connect());
+  log().expectError("exceeds number of allowed active connections for clientType 7");
+  size_t accepted = 0;
+  for (const auto& session : sessions()) {
+    if (!agent().isActiveClientLimitReachedForSession(*session, sessionInfo(7))) ++accepted;
+  }
+  EXPECT_EQ(accepted, 5u);
+  world.runUntilIdle();
+  ASSERT_EQ(sessions().size(), 5u);
+  EXPECT_TRUE(openSession(sessionInfo(7))->isInvalidated());
+  crowd.clear();
+  const auto five = openMany(5, 7);
+  for (const auto& client : five) EXPECT_FALSE(client->isInvalidated());
+}
+
+TEST_F(TelvanedAgentLimitsTest, whatARefusedSessionSentBehindItsInfoIsNotServed) {
+  givenStorebag();
+  const auto five = openMany(5, kClientType);
+  log().expectError("exceeds number of allowed active connections for clientType 6");
+  const auto sixth = connect();
+  sixth->askInPassing(ClientSessionOperation::SetSessionInfo, {sessionInfo(), userInfo(), Value(), false});
+  const auto start = sixth->askInPassing(ClientSessionOperation::StartConfig);
+  world.runUntilIdle();
+  EXPECT_FALSE(start->values.has_value());
+  EXPECT_TRUE(hasNoLine(log(), "createBackendsWithStorebag"));
+}
+
 TEST_F(TelvanedAgentLimitsTest, aSessionInfoWithoutAClientTypeEndsTheSession) {
   log().expectError("isActiveClientLimitReachedForSession: session 0 missing clientType in its sessionInfo ");
   Dictionary info = sessionInfo();
