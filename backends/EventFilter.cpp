@@ -1,6 +1,7 @@
 #include "backends/EventFilter.h"
 
 #include <algorithm>
+#include <utility>
 
 #include "backends/ListMatching.h"
 #include "backends/TelvaneBackend.h"
@@ -100,14 +101,16 @@ void EventFilter::filterEvent(Dictionary& event) const {
   if (_records.empty()) return;
   const int32_t method = event[kEventMethod].int32Value();
   const int32_t status = event[kEventStatus].int32Value();
-  std::vector<Change> changes;
-  for (const DictionaryEntry& entry : event) {
-    if ((_keyMarks & keyMark(entry.key)) == 0) continue;
-    const Record* record = firstRecordFor(entry.key, method, status);
-    if (record == nullptr) continue;
-    if (auto change = changeFor(*record, entry)) changes.push_back(*std::move(change));
-  }
-  for (Change& change : changes) event.set(change.key, std::move(change.replacement));
+  std::vector<std::pair<String, Value>> digests;
+  // One pass, however many spellings of a filtered key a client has sent.
+  event.keepIf([this, method, status, &digests](const String& key, const Value& value) {
+    if ((_keyMarks & keyMark(key)) == 0) return true;
+    const Record* record = firstRecordFor(key, method, status);
+    const Outcome outcome = record != nullptr ? outcomeFor(*record, value) : Outcome::Stays;
+    if (outcome == Outcome::Digested) digests.emplace_back(key, digestOf(value));
+    return outcome != Outcome::Goes;
+  });
+  for (auto& [key, digest] : digests) event.set(key, std::move(digest));
 }
 
 const EventFilter::Record* EventFilter::firstRecordFor(std::string_view key, int32_t method,
@@ -119,22 +122,20 @@ const EventFilter::Record* EventFilter::firstRecordFor(std::string_view key, int
   return found != _records.end() ? &*found : nullptr;
 }
 
-std::optional<EventFilter::Change> EventFilter::changeFor(const Record& record, const DictionaryEntry& entry) {
+EventFilter::Outcome EventFilter::outcomeFor(const Record& record, const Value& value) noexcept {
   switch (record.action) {
     case Action::None:
-      return std::nullopt;
+      return Outcome::Stays;
     case Action::Remove:
-      return Change{entry.key, {}};
+      return Outcome::Goes;
     case Action::SHA256:
-      return Change{entry.key, digestOf(entry.value)};
+      return Outcome::Digested;
     case Action::BlacklistValues:
-      if (entry.value.isString() && containsOneOf(entry.value, record.values)) return Change{entry.key, {}};
-      return std::nullopt;
+      return value.isString() && containsOneOf(value, record.values) ? Outcome::Goes : Outcome::Stays;
     case Action::WhitelistValues:
-      if (entry.value.isString() && !containsOneOf(entry.value, record.values)) return Change{entry.key, {}};
-      return std::nullopt;
+      return value.isString() && !containsOneOf(value, record.values) ? Outcome::Goes : Outcome::Stays;
   }
-  return std::nullopt;
+  return Outcome::Stays;
 }
 
 bool EventFilter::containsOneOf(const Value& value, const std::vector<String>& parts) noexcept {

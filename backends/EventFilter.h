@@ -1,7 +1,6 @@
 #pragma once
 
 #include <cstdint>
-#include <optional>
 #include <string_view>
 #include <vector>
 
@@ -38,19 +37,14 @@ class EventFilter {
     std::vector<String> values;
   };
 
-  // What is to be done to one key of an event.
-  struct Change {
-    String key;
-    Value replacement;  // absent: the key is removed
-  };
+  enum class Outcome : uint8_t { Stays, Goes, Digested };
 
   static Action actionForText(std::string_view text) noexcept;
   static std::string_view textForAction(Action action) noexcept;
   static uint64_t keyMark(std::string_view key) noexcept;
   static bool containsOneOf(const Value& value, const std::vector<String>& parts) noexcept;
   const Record* firstRecordFor(std::string_view key, int32_t method, int32_t status) const noexcept;
-  // Returns what the record does to the key; nothing when all stays.
-  static std::optional<Change> changeFor(const Record& record, const DictionaryEntry& entry);
+  static Outcome outcomeFor(const Record& record, const Value& value) noexcept;
 
   std::vector<Record> _records;
   uint64_t _keyMarks = 0;  // one bit for the mark of each record's key

@@ -110,6 +110,33 @@ TEST(EventFilterTest, matchesKeysOfAnyLength) {
   EXPECT_TRUE(result.contains(longKey + "k"));
 }
 
+// A key of n letters can be spelt in 2^n ways, each of which a filter takes out.
+TEST(EventFilterTest, takesOutAnyNumberOfSpellingsInOnePass) {
+  const std::string letters = "abcdefghijklmnopq";
+  constexpr uint32_t kSpellings = 100'000;
+  Dictionary fields = event({{Key("kept"), 1}});
+  for (uint32_t spelling = 0; spelling < kSpellings; ++spelling) {
+    std::string key = letters;
+    for (size_t index = 0; index < key.size(); ++index) {
+      if ((spelling >> index) % 2 == 1) key[index] = static_cast<char>(key[index] - 'a' + 'A');
+    }
+    fields.set(String(key), 1);
+  }
+  ASSERT_EQ(fields.size(), kSpellings + 3);
+  const Dictionary digested = filtered(Array{Value(entry(letters.c_str(), "sha256"))}, fields);
+  EXPECT_EQ(digested.size(), kSpellings + 3);
+  EXPECT_EQ(digested["ABCDefghijklmnopq"], Value(TelvaneBackend::convertIntoSHA256("1")));
+  EXPECT_EQ(filtered(Array{Value(entry(letters.c_str(), "remove"))}, std::move(fields)), event({{Key("kept"), 1}}));
+}
+
+TEST(EventFilterTest, takesOutAndDigestsFieldsOfOneEvent) {
+  const Array entries{Value(entry("a", "remove")), Value(entry("b", "sha256")), Value(entry("d", "remove"))};
+  EXPECT_EQ(filtered(entries, event({{Key("a"), 1}, {Key("b"), 2}, {Key("c"), 3}, {Key("d"), 4}, {Key("B"), 5}})),
+            event({{Key("b"), TelvaneBackend::convertIntoSHA256("2")},
+                   {Key("c"), 3},
+                   {Key("B"), TelvaneBackend::convertIntoSHA256("5")}}));
+}
+
 TEST(EventFilterTest, takesEntriesOfWrongTypesForEntriesThatSayNothing) {
   const Array entries{5, "text", Value(Array{1}), Value(Dictionary{{kFilterKey, 5}, {kFilterAction, "remove"}}),
                       Value(Dictionary{{kFilterKey, "name"}, {kFilterAction, 2}})};
