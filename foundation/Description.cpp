@@ -2,8 +2,11 @@
 
 #include <algorithm>
 #include <charconv>
+#include <limits>
 #include <string_view>
 #include <vector>
+
+#include "foundation/ShortDescription.h"
 
 namespace telvane {
 namespace {
@@ -23,20 +26,32 @@ void appendNumber(std::string& text, Number number) {
   text.append(buffer, result.ptr);
 }
 
-// Writes one description; the text so far and how deep in containers it stands.
+constexpr size_t kUnlimited = std::numeric_limits<size_t>::max() - 1;
+constexpr std::string_view kEllipsis = "...";
+
+// Writes one description; the text so far and how deep in containers it stands. Stops soon behind the limit.
 class Describer {
  public:
+  explicit Describer(size_t limit = kUnlimited) noexcept : _limit(limit) {}
   void describe(const Value& value);
   void describeArray(const Array& array);
   void describeDictionary(const Dictionary& dictionary);
   void describeText(std::string_view text);
-  std::string take() { return std::move(_text); }
+  void describeData(const Data& data);
+  // Cuts what stands behind the limit.
+  std::string take();
 
  private:
   void appendQuoted(std::string_view text);
   bool isTooDeep();
+  bool isFull() const noexcept { return _text.size() > _limit; }
+  // Of what is still to be described, as many bytes as make the text full for sure.
+  std::string_view within(std::string_view bytes) const noexcept {
+    return isFull() ? std::string_view() : bytes.substr(0, _limit - _text.size() + 1);
+  }
   void beginLine() { _text.append(_depth * kIndentation, ' '); }
 
+  const size_t _limit;
   std::string _text;
   size_t _depth = 0;
 };
@@ -60,7 +75,7 @@ void Describer::describe(const Value& value) {
       describeText(value.text());
       break;
     case Value::Kind::Data:
-      _text += value.data()->description();
+      describeData(*value.data());
       break;
     case Value::Kind::Date:
       describeText(value.date()->description());
@@ -79,6 +94,7 @@ void Describer::describeArray(const Array& array) {
   _text += "(\n";
   ++_depth;
   for (const Value& value : array) {
+    if (isFull()) return;
     if (&value != array.begin()) _text += ",\n";
     beginLine();
     describe(value);
@@ -94,10 +110,16 @@ void Describer::describeDictionary(const Dictionary& dictionary) {
   std::vector<const DictionaryEntry*> entries;
   entries.reserve(dictionary.size());
   for (const DictionaryEntry& entry : dictionary) entries.push_back(&entry);
-  std::sort(entries.begin(), entries.end(), [](const auto* a, const auto* b) { return a->key < b->key; });
+  const auto isBefore = [](const auto* a, const auto* b) { return a->key < b->key; };
+  if (entries.size() > _limit) {  // no more are shown than fit in
+    std::partial_sort(entries.begin(), entries.begin() + static_cast<std::ptrdiff_t>(_limit), entries.end(), isBefore);
+  } else {
+    std::sort(entries.begin(), entries.end(), isBefore);
+  }
   _text += "{\n";
   ++_depth;
   for (const DictionaryEntry* entry : entries) {
+    if (isFull()) return;
     beginLine();
     describeText(entry->key);
     _text += " = ";
@@ -112,10 +134,15 @@ void Describer::describeDictionary(const Dictionary& dictionary) {
 void Describer::describeText(std::string_view text) {
   const bool isBare = _depth == 0 || (!text.empty() && std::all_of(text.begin(), text.end(), isBareCharacter));
   if (isBare) {
-    _text += text;
+    _text += within(text);
   } else {
-    appendQuoted(text);
+    appendQuoted(within(text));
   }
+}
+
+void Describer::describeData(const Data& data) {
+  const std::string_view shown = within(data.view());
+  _text += shown.size() == data.size() ? data.description() : Data::copyOf(shown).description();
 }
 
 void Describer::appendQuoted(std::string_view text) {
@@ -146,14 +173,30 @@ void Describer::appendQuoted(std::string_view text) {
 
 bool Describer::isTooDeep() {
   if (_depth < kDeepestDescribed) return false;
-  _text += "...";
+  _text += kEllipsis;
   return true;
+}
+
+std::string Describer::take() {
+  if (!isFull()) return std::move(_text);
+  const auto isContinuation = [](char c) { return (static_cast<unsigned char>(c) & 0xC0) == 0x80; };
+  size_t end = _limit;
+  while (end > 0 && isContinuation(_text[end])) --end;
+  _text.resize(end);
+  _text += kEllipsis;
+  return std::move(_text);
 }
 
 }  // namespace
 
 std::string description(const Value& value) {
   Describer describer;
+  describer.describe(value);
+  return describer.take();
+}
+
+std::string shortDescription(const Value& value, size_t limit) {
+  Describer describer(limit);
   describer.describe(value);
   return describer.take();
 }

@@ -6,6 +6,8 @@
 #include <cmath>
 #include <limits>
 
+#include "foundation/ShortDescription.h"
+
 namespace telvane::testing {
 namespace {
 
@@ -83,6 +85,42 @@ TEST(DescriptionTest, endsBeyondSixtyFourLevels) {
   EXPECT_EQ(nested(65).find("leaf"), std::string::npos);
   EXPECT_NE(nested(65).find("..."), std::string::npos);
   EXPECT_EQ(nested(100'000), nested(65));
+}
+
+TEST(DescriptionTest, aShortOneIsTheBeginningOfTheWhole) {
+  const Value values[] = {"plain text",
+                          12345678,
+                          Value(),
+                          2.5,
+                          Data::copyOf("\x01\x02\x03\x04\x05\x06\x07\x08\x09"),
+                          Date(),
+                          Array{"a", "two words, quoted", 3, Data::copyOf("bytes"), Value(Array{1, 2, 3})},
+                          Dictionary{{"b", 2}, {"my key", "x"}, {"a", Array{"y", "a-b"}}, {"c", Dictionary{{"d", 1}}}}};
+  for (const Value& value : values) {
+    const std::string whole = description(value);
+    for (size_t limit = 0; limit < whole.size(); ++limit) {
+      EXPECT_EQ(shortDescription(value, limit), whole.substr(0, limit) + "...") << limit;
+    }
+    EXPECT_EQ(shortDescription(value, whole.size()), whole);
+    EXPECT_EQ(shortDescription(value, whole.size() + 1), whole);
+  }
+}
+
+TEST(DescriptionTest, aShortOneDoesNotCutACharacter) {
+  EXPECT_EQ(shortDescription("a\xC3\xA4z", 2), "a...");
+  EXPECT_EQ(shortDescription("a\xC3\xA4z", 3), "a\xC3\xA4...");
+}
+
+TEST(DescriptionTest, aShortOneOfMuchTakesNoMoreThanItShows) {
+  constexpr size_t kMuch = 50u << 20;
+  Array list;
+  for (int index = 0; index < 1'000'000; ++index) list.append(index);
+  for (const Value& value : {Value(std::string(kMuch, 'x')), Value(Data(std::string(kMuch, 'x'))), Value(list),
+                             Value(Array{std::string(kMuch, '"')})}) {
+    const std::string text = shortDescription(value, 100);
+    EXPECT_EQ(text.size(), 103u);
+    EXPECT_LT(text.capacity(), 1000u) << "what is not shown was not made";
+  }
 }
 
 }  // namespace
