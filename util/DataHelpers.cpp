@@ -7,6 +7,7 @@
 #include "interfaces/DefaultsKeys.h"
 #include "interfaces/SessionKeys.h"
 #include "platform/Compression.h"
+#include "platform/Crypto.h"
 #include "platform/Platform.h"
 
 namespace telvane {
@@ -71,6 +72,23 @@ std::string lowerCased(std::string_view text) {
   return result;
 }
 
+bool hasControlCharacter(std::string_view text) {
+  return std::any_of(text.begin(), text.end(), [](unsigned char c) { return c < ' ' || c == 0x7F; });
+}
+
+std::string digestOf(std::string_view text) {
+  return crypto::lowercaseHex(crypto::sha256({reinterpret_cast<const uint8_t*>(text.data()), text.size()}));
+}
+
+// The settings of all clients are in one file, of which a single name must not take much, or what cannot be written.
+std::string identifierKey(std::string_view clientPart, std::string_view suffixPart) {
+  constexpr size_t kLongestParts = 256;  // bytes, of both
+  const bool isPlain = clientPart.size() <= kLongestParts && suffixPart.size() <= kLongestParts - clientPart.size() &&
+                       !hasControlCharacter(clientPart) && !hasControlCharacter(suffixPart);
+  if (isPlain) return fmt::format("uuid:{}:{}", clientPart, suffixPart);
+  return fmt::format("uuid:{}:{}", digestOf(clientPart), digestOf(suffixPart));
+}
+
 uint32_t allocationSize(const Value& value) noexcept {
   switch (value.kind()) {
     case Value::Kind::String:
@@ -102,7 +120,7 @@ std::optional<Data> gzipDeflate(Log& log, std::string_view data) { return compre
 
 String getPersistentIdentifierForCustomClientIDSuffix(Platform& platform, std::string_view clientPart,
                                                       std::string_view suffixPart) {
-  const std::string key = fmt::format("uuid:{}:{}", clientPart, suffixPart);
+  const std::string key = identifierKey(clientPart, suffixPart);
   const Value value = platform.userDefaults.objectForKeyOrStore(
       kTelvaneDefaultsSuite, key, [&platform] { return Value(platform.random.newUUID().string()); });
   platform.log.message("getPersistentIdentifierForCustomClientIDSuffix: The value for {}: {}", key, value);
@@ -141,14 +159,19 @@ int64_t minuteRounding(int64_t seconds, bool isInternalBuild) noexcept {
 }
 
 uint32_t objectSizeEstimate(const Value& value) noexcept {
+  if (const Dictionary* dictionary = value.dictionary()) return objectSizeEstimate(*dictionary);
   uint32_t sum = 0;
-  if (const Dictionary* dictionary = value.dictionary()) {
-    for (const DictionaryEntry& entry : *dictionary) {
-      sum += static_cast<uint32_t>(sizeof(DictionaryEntry) - sizeof(Value) + entry.key.size());
-      sum += allocationSize(entry.value) + objectSizeEstimate(entry.value);
-    }
-  } else if (const Array* array = value.array()) {
+  if (const Array* array = value.array()) {
     for (const Value& element : *array) sum += allocationSize(element) + objectSizeEstimate(element);
+  }
+  return sum;
+}
+
+uint32_t objectSizeEstimate(const Dictionary& dictionary) noexcept {
+  uint32_t sum = 0;
+  for (const DictionaryEntry& entry : dictionary) {
+    sum += static_cast<uint32_t>(sizeof(DictionaryEntry) - sizeof(Value) + entry.key.size());
+    sum += allocationSize(entry.value) + objectSizeEstimate(entry.value);
   }
   return sum;
 }

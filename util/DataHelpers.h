@@ -22,7 +22,9 @@ std::optional<Data> compressDataWithZlibOrGzip(Log& log, bool useGzip, std::stri
 // The same with gzip.
 std::optional<Data> gzipDeflate(Log& log, std::string_view data);
 
-// Returns the identifier kept for the two parts (each may be empty), making and storing one on first use.
+// Returns the identifier kept for the two parts (each may be empty), making and storing one on first use. It is kept
+// under "uuid:<client part>:<suffix part>". Parts come from clients: where they are longer than 256 bytes together, or
+// one has control characters, each stands there by its SHA-256.
 String getPersistentIdentifierForCustomClientIDSuffix(Platform& platform, std::string_view clientPart,
                                                       std::string_view suffixPart);
 
@@ -45,5 +47,12 @@ int64_t minuteRounding(int64_t seconds, bool isInternalBuild) noexcept;
 // Estimates the memory of a container's content in bytes: keys, values and, recursively, what they contain; 0 for
 // anything but a container. Wraps at 32 bits.
 uint32_t objectSizeEstimate(const Value& value) noexcept;
+uint32_t objectSizeEstimate(const Dictionary& dictionary) noexcept;
+
+// An absent value for absent text, which shows as "(null)" in lines and headers.
+template <class T>
+Value valueOf(const std::optional<T>& value) {
+  return value.has_value() ? Value(*value) : Value();
+}
 
 }  // namespace telvane

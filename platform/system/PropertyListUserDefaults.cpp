@@ -87,6 +87,11 @@ Result<void> PropertyListUserDefaults::store(const std::string& path, const Dict
   changed.set(String(key), std::move(value));
   const Result<Data> bytes = propertylist::serialize(changed, propertylist::Format::Binary);
   if (!bytes) return bytes.error();
+  // What the next reader refused would count as garbage, and the suite would begin anew without its old entries.
+  if (const Result<Value> readBack = propertylist::parse(*bytes); !readBack) {
+    return platformError(static_cast<int>(readBack.error().code()),
+                         path + " is not changed, since it could not be read back: " + readBack.error().description());
+  }
   if (old.state == DictionaryFiles::State::Garbage && std::rename(path.c_str(), (path + ".corrupt").c_str()) != 0) {
     return errnoError(errno, "Cannot keep the garbage in " + path);
   }

@@ -14,7 +14,8 @@ namespace telvane {
 //
 // Writers take turns through a lock on the file .<suite>.lock beside the list, read the list anew, and put a new file
 // in its place. A list that was garbage is kept as <suite>.plist.corrupt when the first write replaces it; one that
-// cannot be read is not replaced, the write fails.
+// cannot be read is not replaced, the write fails. So does one of what could not be read back, such as more than
+// 16 MiB: the list stays as it is.
 //
 // A suite's name is 1 to 200 bytes without a slash, a null character, or a dot in front: any other is an empty suite
 // that cannot be written (EINVAL).

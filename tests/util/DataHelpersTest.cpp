@@ -8,6 +8,7 @@
 #include "interfaces/DefaultsKeys.h"
 #include "interfaces/SessionKeys.h"
 #include "platform/Compression.h"
+#include "platform/Crypto.h"
 #include "tests/support/Matchers.h"
 #include "tests/support/SimulatedWorld.h"
 
@@ -66,6 +67,31 @@ TEST_F(DataHelpersTest, aPersistentIdentifierStaysAndDiffersByItsParts) {
 TEST_F(DataHelpersTest, missingPartsOfAnIdentifierAreEmpty) {
   const String made = identifier("", "");
   EXPECT_EQ(process.userDefaults().objectForKey("com.corvex.telvane", "uuid::"), Value(made));
+}
+
+TEST_F(DataHelpersTest, namesThatTakeMuchStandInTheSettingsByTheirDigests) {
+  const auto digest = [](const std::string& text) {
+    return crypto::lowercaseHex(crypto::sha256({reinterpret_cast<const uint8_t*>(text.data()), text.size()}));
+  };
+  const auto storedKey = [this](const std::string& clientPart, const std::string& suffixPart) {
+    const String made = identifier(clientPart, suffixPart);
+    EXPECT_EQ(identifier(clientPart, suffixPart), made) << "the same names, the same identifier";
+    for (const DictionaryEntry& entry : process.userDefaults().dictionaryRepresentation("com.corvex.telvane")) {
+      if (entry.value == Value(made)) return entry.key.str();
+    }
+    return std::string();
+  };
+  const std::string longest(200, 'c');
+  const std::string rest(56, 's');
+  EXPECT_EQ(storedKey(longest, rest), "uuid:" + longest + ":" + rest);
+  EXPECT_EQ(storedKey(longest, rest + "s"), "uuid:" + digest(longest) + ":" + digest(rest + "s"));
+  const std::string huge(20u << 20, 'h');
+  EXPECT_EQ(storedKey(huge, ""), "uuid:" + digest(huge) + ":" + digest(""));
+  EXPECT_EQ(storedKey("", huge), "uuid:" + digest("") + ":" + digest(huge));
+  for (const std::string& name : {std::string("a\0b", 3), std::string("a\nb"), std::string("a\x7f")}) {
+    EXPECT_EQ(storedKey(name, "player"), "uuid:" + digest(name) + ":" + digest("player"));
+    EXPECT_EQ(storedKey("player", name), "uuid:" + digest("player") + ":" + digest(name));
+  }
 }
 
 TEST_F(DataHelpersTest, theDeviceIDIsCutToItsBuffer) {

@@ -232,6 +232,18 @@ TEST_F(PropertyListUserDefaultsTest, refusesAValueThatAListCannotHoldAndKeepsThe
   EXPECT_TRUE(holds(stored(), Dictionary{{"a", 1}}));
 }
 
+// One entry of 17 MiB was once written, found too large by the next reader, and taken for garbage by the next writer.
+TEST_F(PropertyListUserDefaultsTest, refusesWhatItCouldNotReadBackAndKeepsTheOldEntries) {
+  ASSERT_TRUE(succeeds(_defaults.setObject(kSuite, "a", 1)));
+  const std::string before = _folder.read(kUserFile);
+  EXPECT_TRUE(failsWith(_defaults.setObject(kSuite, "b", std::string(17u << 20, 'x')), EFBIG));
+  EXPECT_TRUE(failsWith(_defaults.setObject(kSuite, std::string(17u << 20, 'k'), 1), EFBIG));
+  EXPECT_EQ(_folder.read(kUserFile), before);
+  ASSERT_TRUE(succeeds(_defaults.setObject(kSuite, "c", 3)));
+  EXPECT_TRUE(holds(stored(), Dictionary{{"a", 1}, {"c", 3}}));
+  EXPECT_FALSE(std::filesystem::exists(_folder.at(kUserFile) + ".corrupt"));
+}
+
 TEST_F(PropertyListUserDefaultsTest, letsOnlyTheUserReadTheFile) {
   ASSERT_TRUE(succeeds(_defaults.setObject(kSuite, "a", 1)));
   struct stat status {};
