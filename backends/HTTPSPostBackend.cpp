@@ -43,6 +43,8 @@ HTTPSPostBackend::HTTPSPostBackend(const ProcessContext& context, String name, D
       platform.userDefaults.objectForKey(kTelvaneDefaultsSuite, kDefaultsForceEventLogging).booleanValue();
 }
 
+HTTPSPostBackend::~HTTPSPostBackend() { tellDroppedEvents(); }
+
 void HTTPSPostBackend::takeDefaultPostURLs() {
   const UserDefaults& userDefaults = _context.platform().userDefaults;
   _postURL = userDefaultsString(userDefaults, kDefaultsHTTPSPostURL);
@@ -79,7 +81,7 @@ uint64_t HTTPSPostBackend::batchedEventsSize() const {
   _stateQueue->sync([this, &size] {
     _stateQueue->assertOnQueue();
     if (!_batchedEvents.has_value()) return;
-    for (const Dictionary& event : *_batchedEvents) size += objectSizeEstimate(Value(event));
+    for (const Dictionary& event : *_batchedEvents) size += objectSizeEstimate(event);
   });
   return size;
 }

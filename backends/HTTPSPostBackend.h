@@ -20,14 +20,17 @@ namespace telvane {
 // on the state queue; flushes run there, on the caller's thread. Posts are handed to the connectivity helper and
 // forgotten: an answer touches only the state and the flush's completion, also when this object is long gone.
 //
-// At most 50 events of one method wait (the storebag may say otherwise). A failed post loses its events; a server error
-// (500 to 599) disables the backend. The first flush that gave text freezes the configuration.
+// At most 50 events of one method wait (the storebag may say otherwise), and of all together what is estimated at 8
+// MiB: an event that would come above either flushes the others first. Where such a flush has to wait for user info,
+// the events that find no room are dropped, with one error line per burst. A failed post loses its events; a server
+// error (500 to 599) disables the backend. The first flush that gave text freezes the configuration.
 class HTTPSPostBackend final : public TelvaneBackend {
  public:
   // Null without a profile that lists clients (one error line when only the list is missing) or a product family.
   static std::shared_ptr<HTTPSPostBackend> initWithName(const ProcessContext& context, const String& name,
                                                         const Value& profile,
                                                         const std::optional<String>& productFamily);
+  ~HTTPSPostBackend() override;
 
   // Reads the storebag section anew: consent, country, device, sampling, filters, lists, URLs.
   uint32_t updateState() override;
@@ -43,6 +46,10 @@ class HTTPSPostBackend final : public TelvaneBackend {
 
  private:
   static constexpr int32_t kDefaultEventThreshold = 49;
+  // The estimated bytes of events that wait together. One larger event may wait alone.
+  static constexpr uint64_t kMaximumBatchBytes = 8u << 20;
+  // The estimated bytes that user info may add to a batch, one copy for each event.
+  static constexpr uint64_t kMaximumUserInfoBytes = 32u << 20;
 
   // How the user's consent to diagnostics and the client entry go together; the number is told to the collector.
   enum class DNUType : int32_t { Respected = 0, OverriddenWithoutConsent = 1, OverriddenWithConsent = 2 };
@@ -122,7 +129,18 @@ class HTTPSPostBackend final : public TelvaneBackend {
                                             uint32_t flag);
   std::optional<String> batchEvent(Dictionary event);
   bool countEvent(uint16_t method) REQUIRES(*_stateQueue);
+  bool hasRoomFor(uint64_t bytes) const REQUIRES(*_stateQueue);
+  // Flushes because of an event of this method, whose count begins anew.
+  std::optional<String> flushForEvent(uint16_t method) REQUIRES(*_stateQueue);
+  std::optional<String> flushForRoom(uint16_t method) REQUIRES(*_stateQueue);
+  bool lacksUserInfo() const noexcept { return _requireUserInfo && !_userInfoDict.has_value(); }
   FlushResult flushOnStateQueue(FlushCompletion& completion) REQUIRES(*_stateQueue);
+  // Ends the batch and returns its events.
+  std::vector<Dictionary> takeBatch() REQUIRES(*_stateQueue);
+  // Ends a burst of drops with its line.
+  void tellDroppedEvents() REQUIRES(*_stateQueue);
+  // Drops the newest events, with an error line, when user info that came after them would make them too large.
+  void leaveRoomForUserInfo(std::vector<Dictionary>& events, const std::optional<Dictionary>& userInfo) const;
   // Returns the text, which the completion gets with the answer.
   std::optional<String> postBatch(PostMessage message, FlushCompletion& completion);
   std::vector<Dictionary> takeListedEvents(std::vector<Dictionary> events, const std::optional<Dictionary>& userInfo);
@@ -165,6 +183,8 @@ class HTTPSPostBackend final : public TelvaneBackend {
 
   // Guarded by the state queue.
   std::optional<std::vector<Dictionary>> _batchedEvents GUARDED_BY(*_stateQueue);
+  uint64_t _batchedBytes GUARDED_BY(*_stateQueue) = 0;   // estimated, of the events in the batch
+  uint32_t _droppedEvents GUARDED_BY(*_stateQueue) = 0;  // for want of room, since the batch began
   std::unordered_map<uint16_t, int32_t> _eventMethodCounts GUARDED_BY(*_stateQueue);
 };
 

@@ -18,11 +18,6 @@ Value valueOf(const T& value) {
   return Value(value);
 }
 
-template <class T>
-Value valueOf(const std::optional<T>& value) {
-  return value.has_value() ? Value(*value) : Value();
-}
-
 std::string_view viewOf(const std::optional<String>& text) {
   return text.has_value() ? text->view() : std::string_view();
 }

@@ -4,6 +4,7 @@
 
 #include "backends/HTTPSPostBackend.h"
 #include "backends/MessageFlags.h"
+#include "foundation/ShortDescription.h"
 #include "interfaces/EventKeys.h"
 #include "interfaces/SessionKeys.h"
 #include "interfaces/TelvaneErrors.h"
@@ -29,8 +30,14 @@ bool isNumberedByClient(uint32_t clientType) { return clientType == 7 || clientT
 
 Value orMinusOne(const Value& number) { return number.isPresent() ? number : Value(-1); }
 
-// Whether JSON has a form for the value and for everything in it.
-bool isWritable(const Value& value) {
+// JSON is written 64 levels deep; the body, its list of events and the event itself stand around a value.
+constexpr size_t kDeepestValue = 61;
+// The longest description of a value, or of its key, that a line holds: bytes.
+constexpr size_t kLongestDescription = 1024;
+
+// Whether JSON has a form for the value and for everything in it, at most this many levels deep.
+bool isWritable(const Value& value, size_t levels = kDeepestValue) {
+  if (levels == 0) return false;
   switch (value.kind()) {
     case Value::Kind::Boolean:
     case Value::Kind::Integer:
@@ -40,10 +47,11 @@ bool isWritable(const Value& value) {
     case Value::Kind::Real:
       return std::isfinite(*value.real());
     case Value::Kind::Array:
-      return std::all_of(value.array()->begin(), value.array()->end(), isWritable);
+      return std::all_of(value.array()->begin(), value.array()->end(),
+                         [levels](const Value& element) { return isWritable(element, levels - 1); });
     case Value::Kind::Dictionary:
       return std::all_of(value.dictionary()->begin(), value.dictionary()->end(),
-                         [](const DictionaryEntry& entry) { return isWritable(entry.value); });
+                         [levels](const DictionaryEntry& entry) { return isWritable(entry.value, levels - 1); });
     default:
       return false;
   }
@@ -68,7 +76,7 @@ std::optional<String> HTTPSPostBackend::sendMessage(Dictionary blob, Date timest
   }
   const bool isDecided = before.state != TelvaneBackendStateUnknown && before.state != TelvaneBackendStateSampledOut;
   const bool isForNow = isRealtime(flag) || !_batchEvents;
-  if (isDecided && isForNow && (!_requireUserInfo || _userInfoDict.has_value())) {
+  if (isDecided && isForNow && !lacksUserInfo()) {
     return sendStandaloneEvent(std::move(event), before, numbers, flag);
   }
   log().message("HTTPSPostBackend(sendMessage): Batching {}, {}, {}", before.state, static_cast<int>(_batchEvents),
@@ -170,8 +178,7 @@ std::optional<String> HTTPSPostBackend::sendStandaloneEvent(Dictionary event, co
   if (!message.has_value()) return std::nullopt;
   std::optional<String> text = std::move(message->prettyText);
   if (flushed.has_value()) {
-    text =
-        fmt::format("Flushed events:\n{}\nStandalone event:\n{}", *flushed, text.has_value() ? Value(*text) : Value());
+    text = fmt::format("Flushed events:\n{}\nStandalone event:\n{}", *flushed, valueOf(text));
   }
   postJSONMessage(std::move(message->json), flag, &numbers, nullptr);
   if (flushed.has_value()) _immutable = true;
@@ -181,7 +188,8 @@ std::optional<String> HTTPSPostBackend::sendStandaloneEvent(Dictionary event, co
 // One visit to the state queue: the event comes in behind the flush that it caused.
 std::optional<String> HTTPSPostBackend::batchEvent(Dictionary event) {
   std::optional<String> flushed;
-  _stateQueue->sync([this, &event, &flushed] {
+  const uint64_t bytes = objectSizeEstimate(event);
+  _stateQueue->sync([this, &event, &flushed, bytes] {
     _stateQueue->assertOnQueue();
     if (!_batchedEvents.has_value()) _batchedEvents.emplace();
     const uint16_t method = event[kEventMethod].low16Bits();
@@ -189,15 +197,55 @@ std::optional<String> HTTPSPostBackend::batchEvent(Dictionary event) {
       log().message(
           "HTTPSPostBackend(batchEvent): Flushing all batched events as we reached event threshold for method {}",
           method);
-      FlushCompletion none;
-      flushed = flushOnStateQueue(none).text;
-      // The event that starts the next batch is the first of its count.
-      _eventMethodCounts[method] = 1;
+      flushed = flushForEvent(method);
+    } else if (!hasRoomFor(bytes)) {
+      flushed = flushForRoom(method);
+    }
+    if (!hasRoomFor(bytes)) {
+      --_eventMethodCounts[method];
+      ++_droppedEvents;
+      return;
     }
     if (!_batchedEvents.has_value()) _batchedEvents.emplace();
+    _batchedBytes += bytes;
     _batchedEvents->push_back(std::move(event));
   });
   return flushed;
+}
+
+std::optional<String> HTTPSPostBackend::flushForEvent(uint16_t method) {
+  FlushCompletion none;
+  std::optional<String> text = flushOnStateQueue(none).text;
+  // The event that starts the next batch is the first of its count.
+  _eventMethodCounts[method] = 1;
+  return text;
+}
+
+// Leaves the batch alone when that has to wait for user info.
+std::optional<String> HTTPSPostBackend::flushForRoom(uint16_t method) {
+  if (_state == TelvaneBackendStateEnabled && lacksUserInfo()) return std::nullopt;
+  log().message("HTTPSPostBackend(batchEvent): Flushing all batched events early as they take {} bytes", _batchedBytes);
+  return flushForEvent(method);
+}
+
+// An event that is too large by itself waits alone.
+bool HTTPSPostBackend::hasRoomFor(uint64_t bytes) const {
+  return _batchedBytes == 0 || _batchedBytes + bytes <= kMaximumBatchBytes;
+}
+
+void HTTPSPostBackend::tellDroppedEvents() {
+  if (_droppedEvents == 0) return;
+  log().error(
+      "HTTPSPostBackend(batchEvent): Dropped {} events, since those that wait took {} of {} bytes and cannot be "
+      "flushed "
+      "without user info",
+      std::exchange(_droppedEvents, 0), _batchedBytes, kMaximumBatchBytes);
+}
+
+std::vector<Dictionary> HTTPSPostBackend::takeBatch() {
+  tellDroppedEvents();
+  _batchedBytes = 0;
+  return *std::exchange(_batchedEvents, std::nullopt);
 }
 
 // Counts the event; returns whether the events that wait must go before it is one of them.
@@ -220,17 +268,19 @@ std::optional<String> HTTPSPostBackend::flushMessagesWithCompletion(FlushComplet
 
 // Takes the completion along with a post; leaves it alone when it returns an error.
 HTTPSPostBackend::FlushResult HTTPSPostBackend::flushOnStateQueue(FlushCompletion& completion) {
-  if (!_batchedEvents.has_value() || _state != TelvaneBackendStateEnabled) {
-    _batchedEvents.reset();
+  if (_batchedEvents.has_value() && _state != TelvaneBackendStateEnabled) takeBatch();
+  if (!_batchedEvents.has_value()) {
     return {.text = {}, .error = failure("Nothing to flush")};
   }
-  if (_requireUserInfo && !_userInfoDict.has_value()) {
+  if (lacksUserInfo()) {
     return {.text = {}, .error = failure("Can not flush: userInfo is required")};
   }
   log().message("HTTPSPostBackend(flushMessagesWithCompletion): called");
   std::optional<Dictionary> userInfo = _userInfoDict;
   if (userInfo.has_value()) _filters.filterEvent(*userInfo);
-  std::vector<Dictionary> events = takeListedEvents(*std::exchange(_batchedEvents, std::nullopt), userInfo);
+  std::vector<Dictionary> events = takeBatch();
+  leaveRoomForUserInfo(events, userInfo);
+  events = takeListedEvents(std::move(events), userInfo);
   _eventMethodCounts.clear();
   std::optional<PostMessage> message;
   if (!events.empty()) message = createMessageForPostAndLogging(std::move(events));
@@ -251,6 +301,20 @@ std::optional<String> HTTPSPostBackend::postBatch(PostMessage message, FlushComp
   postJSONMessage(std::move(message.json), kOrdinaryFlag, nullptr, std::move(finish));
   if (message.prettyText.has_value()) _immutable = true;
   return std::move(message.prettyText);
+}
+
+// Events share their user info, the body has it once for each. What was there when an event was made is counted with
+// the event, so this is about user info that has grown since.
+void HTTPSPostBackend::leaveRoomForUserInfo(std::vector<Dictionary>& events,
+                                            const std::optional<Dictionary>& userInfo) const {
+  const uint64_t bytes = userInfo.has_value() ? objectSizeEstimate(*userInfo) : 0;
+  const uint64_t most = bytes > 0 ? std::max<uint64_t>(kMaximumUserInfoBytes / bytes, 1) : events.size();
+  if (events.size() <= most) return;
+  log().error(
+      "HTTPSPostBackend(flushMessagesWithCompletion): Dropped {} events, since each would take {} bytes of user info "
+      "along",
+      events.size() - most, bytes);
+  events.erase(events.begin() + static_cast<std::ptrdiff_t>(most), events.end());
 }
 
 std::vector<Dictionary> HTTPSPostBackend::takeListedEvents(std::vector<Dictionary> events,
@@ -316,7 +380,7 @@ void HTTPSPostBackend::removeWhatJSONCannotHold(Dictionary& event) const {
     if (isHeld(value)) return true;
     log().error(
         "HTTPSPostBackend(createMessageForPostAndLogging): NSJSONSerialization unable to handle key: {}, value: {}",
-        key, value);
+        shortDescription(key, kLongestDescription), shortDescription(value, kLongestDescription));
     return false;
   });
 }

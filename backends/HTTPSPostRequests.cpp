@@ -13,7 +13,7 @@
 namespace telvane {
 namespace {
 
-constexpr size_t kHeaderCount = 14;
+constexpr size_t kHeaderCount = 13;
 constexpr size_t kLongestSessionID = 40;  // characters
 constexpr int kFirstServerError = 500;
 constexpr int kLastServerError = 599;
@@ -53,8 +53,6 @@ std::string digestText(const Data& key, std::string_view json) {
       crypto::hmacSHA1({key.bytes(), key.size()}, {reinterpret_cast<const uint8_t*>(json.data()), json.size()});
   return Data::copyOf(std::span<const uint8_t>(digest)).description();
 }
-
-Value orNone(const std::optional<String>& text) { return text.has_value() ? Value(*text) : Value(); }
 
 }  // namespace
 
@@ -124,7 +122,7 @@ void HTTPSPostBackend::addIdentityHeaders(URLRequest& request, const EventNumber
   }
   if (_isInternal) headers.push_back({"X-TVN-Internal-Build", "1"});
   headers.push_back({"User-Agent", headerText(fmt::format("Telvane/{} ({}; {})", selfVersionText(),
-                                                          orNone(_hardwareType), orNone(_productVersion)))});
+                                                          valueOf(_hardwareType), valueOf(_productVersion)))});
   headers.push_back({"X-TVN-Client-Version", fmt::format("{}", _clientVersion)});
   headers.push_back({"X-TVN-Sender", std::string(senderName())});
   if (numbers != nullptr) {

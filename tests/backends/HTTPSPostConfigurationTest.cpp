@@ -626,6 +626,63 @@ TEST_F(HTTPSPostConfigurationTest, withoutAnyPostURLTheThresholdIsTheUsualOne) {
   EXPECT_TRUE(hasLine(log(), "HTTPSPostBackend(updatePostLink): realtimePostURL defaults to postURL '(null)'"));
 }
 
+// No entry's URL is taken then, so none of them answers for the rest either.
+TEST_F(HTTPSPostConfigurationTest, withAPostURLOfTheUserDefaultsAndWithoutUserInfoTheThresholdIsTheUsualOne) {
+  givenDefault(kDefaultsHTTPSPostURL, "https://mine.example/");
+  _requiresUserInfo = false;
+  _clients = Array{Value(Dictionary{{kClientEntryPostURL, "https://first.example/"},
+                                    {kClientEntryEventThreshold, 3},
+                                    {kClientEntryExtrasOnInternal, 1}})};
+  EXPECT_EQ(makeUndecidedBackend().updateState(), kEnabled);
+  EXPECT_TRUE(hasLine(log(), "resetBackendStateWithClient: event_threshold set to 49"));
+  EXPECT_TRUE(hasLine(log(), "setBackendStateWithClient: extras on internal is set to 0"));
+  EXPECT_EQ(postURL(), "https://mine.example/");
+}
+
+TEST_F(HTTPSPostConfigurationTest, theOverrideOfSamplingStaysUntilAnotherEntrySamplesOut) {
+  givenSamplingFactor(0.5);
+  const auto entryFor = [this](const char* client, Value threshold, Value override) {
+    Dictionary entry = _client;
+    entry.set(kClientEntryClient, client);
+    entry.set(kClientEntrySamplingThreshold, std::move(threshold));
+    entry.set(kClientEntryOverrideSampling, std::move(override));
+    return Value(entry);
+  };
+  _clients = Array{entryFor("held", 0.25, 0.75), entryFor("sampled", 1.0, 0.6), entryFor("none", Value(), 0.6),
+                   entryFor("bare", 0.25, Value())};
+  makeBackend();
+  const auto toldOverrideOf = [this](const char* client, uint32_t state) {
+    backend().setUserInfoDict(Dictionary{{kTelvaneUserInfoClientName, client}});
+    EXPECT_EQ(backend().updateState(), state) << client;
+    backend().setState(kEnabled);
+    return posted({}, 0, 1)[kEventOverrideSampling];
+  };
+  EXPECT_EQ(toldOverrideOf("held", kSampledOut), Value(0.75));
+  EXPECT_EQ(toldOverrideOf("sampled", kEnabled), Value(0.75)) << "below the threshold nobody looks at it";
+  EXPECT_EQ(toldOverrideOf("none", kDisabled), Value(0.75));
+  EXPECT_EQ(toldOverrideOf("bare", kSampledOut), Value(-1));
+}
+
+TEST_F(HTTPSPostConfigurationTest, aCustomIdentifierStaysAndExtrasOnInternalDoNotWhenAnotherEntryMatches) {
+  _isInternal = true;
+  Dictionary first = entryWith(kClientEntryClient, "first");
+  first.set(kClientEntryCustomClientId, true);
+  first.set(kClientEntryExtrasOnInternal, 1);
+  _clients = Array{Value(first), Value(_client)};
+  makeBackend();
+  const auto clientIdOf = [this](const char* client) {
+    backend().setUserInfoDict(Dictionary{{kTelvaneUserInfoClientName, client}});
+    backend().updateState();
+    posted({});
+    const Value body = RecordingConnectivity::bodyValue(posts().lastRequest());
+    return (*body.dictionary())[kBodyClientId];
+  };
+  EXPECT_EQ(clientIdOf("first"), Value("device-id"));
+  const Value custom = process().userDefaults().objectForKey(kTelvaneDefaultsSuite, "uuid:first:");
+  ASSERT_TRUE(custom.isString());
+  EXPECT_EQ(clientIdOf("other"), custom);
+}
+
 TEST_F(HTTPSPostConfigurationTest, theFirstMatchingEntrySaysWhetherToBatch) {
   _client.set(kClientEntryExpedite, 1);
   makeBackend();

@@ -403,13 +403,59 @@ TEST_F(HTTPSPostEventsTest, aNestedValueThatCannotBeWrittenGoesAsAWhole) {
   EXPECT_EQ(event["kept"], Value(Array{1}));
 }
 
-TEST_F(HTTPSPostEventsTest, aBodyThatCannotBeWrittenIsNotPosted) {
-  log().expectError("HTTPSPostBackend(createMessageForPostAndLogging): no JSON made");
+// JSON is written 64 levels deep, and three of them are around a value: body, list of events, event.
+TEST_F(HTTPSPostEventsTest, aValueDeeperThanTheBodyHoldsGoesAlone) {
+  const auto nested = [](int depth) {
+    Value value = 1;
+    for (int level = 1; level < depth; ++level) {
+      value = level % 2 == 0 ? Value(Array{Value(value)}) : Value(Dictionary{{Key("k"), value}});
+    }
+    return value;
+  };
+  log().expectError("unable to handle key: tooDeep, value:");
+  log().expectError("unable to handle key: muchTooDeep, value:");
+  log().expectError("unable to handle key: shared, value:");
+  log().expectError("unable to handle key: user, value:");
+  _allowsNestedData = true;
+  _userInfo = Dictionary{{kTelvaneUserInfoClientName, "player"}, {Key("user"), nested(62)}};
+  makeBackend();
+  backend().setBatchEvents(false);
+  sendBlob({{kTelvaneMessageBlobClientData,
+             Dictionary{{Key("deepest"), nested(61)}, {Key("tooDeep"), nested(62)}, {Key("muchTooDeep"), nested(500)}}},
+            {kTelvaneMessageBlobSharedData, Dictionary{{Key("shared"), nested(62)}, {Key("kept"), nested(61)}}}});
+  const Dictionary event = lastEvent();
+  EXPECT_EQ(event["deepest"], nested(61));
+  EXPECT_EQ(event["kept"], nested(61));
+  for (const char* gone : {"tooDeep", "muchTooDeep", "shared", "user"}) EXPECT_FALSE(event.contains(gone)) << gone;
+}
+
+TEST_F(HTTPSPostEventsTest, theLineAboutAValueShowsOnlyItsBeginning) {
+  const std::string key(5000, 'k');
+  log().expectError("unable to handle key: " + key.substr(0, 1024) + "..., value: <01010101");
+  makeBackend();
+  Dictionary payload;
+  payload.set(String(key), Data(std::string(20u << 20, '\x01')));
+  posted(std::move(payload));
+  const std::string text = log().text();
+  const size_t start = text.find("unable to handle key");
+  ASSERT_NE(start, std::string::npos);
+  EXPECT_LT(text.find('\n', start) - start, 2200u);
+}
+
+// What the session adds stands beside the payload; without one, the message is the payload.
+TEST_F(HTTPSPostEventsTest, sharedDataOfAMessageWithoutAPayloadIsItsContentToo) {
+  const Dictionary shared{{Key("more"), 1}};
   _allowsNestedData = true;
   makeBackend();
   backend().setBatchEvents(false);
-  EXPECT_EQ(send({{Key("list"), nestedTooDeep()}}), std::nullopt);
-  EXPECT_EQ(posts().count(), 0u);
+  sendBlob({{kTelvaneMessageBlobSharedData, shared}});
+  EXPECT_EQ(lastEvent()[kTelvaneMessageBlobSharedData], Value(shared));
+  EXPECT_EQ(lastEvent()["more"], Value(1));
+  log().expectError("unable to handle key: SharedData, value: {");
+  backend().setAllowNestedData(false);
+  sendBlob({{kTelvaneMessageBlobSharedData, shared}});
+  EXPECT_FALSE(lastEvent().contains(kTelvaneMessageBlobSharedData));
+  EXPECT_EQ(lastEvent()["more"], Value(1));
 }
 
 TEST_F(HTTPSPostEventsTest, filtersTouchTheEventAndTheBody) {

@@ -19,6 +19,12 @@ class HTTPSPostFlushTest : public BackendFixture {
     for (const Value& event : posts().events(index)) numbers.push_back((*event.dictionary())["n"].integerValue());
     return numbers;
   }
+  // Sends that many events of about 1 MiB, each of a method of its own, so that no threshold is near.
+  void sendLarge(int count) {
+    for (int n = 0; n < count; ++n) {
+      send({{Key("n"), n}, {Key("text"), std::string(1u << 20, 'x')}}, static_cast<uint16_t>(100 + n));
+    }
+  }
   static std::vector<int64_t> upTo(int64_t count) {
     std::vector<int64_t> numbers;
     for (int64_t n = 0; n < count; ++n) numbers.push_back(n);
@@ -183,13 +189,28 @@ TEST_F(HTTPSPostFlushTest, aBatchThatIsFilteredOutIsSaidSo) {
   EXPECT_EQ(flush()->error, failure("Nothing to flush")) << "the batch is gone";
 }
 
-TEST_F(HTTPSPostFlushTest, aBatchThatCannotBeWrittenIsLost) {
-  log().expectError("no JSON made");
+TEST_F(HTTPSPostFlushTest, aValueThatIsTooDeepGoesAloneAndTheBatchIsSent) {
+  log().expectError("unable to handle key: list, value: (");
   _allowsNestedData = true;
   makeBackend();
-  send({{Key("list"), nestedTooDeep()}});
-  EXPECT_EQ(flush()->error, failure("Nothing to flush: batched events were completely filtered out"));
-  EXPECT_EQ(posts().count(), 0u);
+  send({{Key("n"), 0}, {Key("list"), nestedTooDeep()}});
+  send({{Key("n"), 1}});
+  flush();
+  ASSERT_EQ(posts().count(), 1u);
+  EXPECT_EQ(postedNumbers(0), upTo(2));
+  EXPECT_FALSE((*posts().events(0)[0].dictionary()).contains("list"));
+}
+
+TEST_F(HTTPSPostFlushTest, userInfoThatIsTooDeepGoesFromEachEventAlone) {
+  log().expectError("unable to handle key: list, value: (");
+  _allowsNestedData = true;
+  makeBackend();
+  sendMany(2);
+  backend().setUserInfoDict(Dictionary{{kTelvaneUserInfoClientName, "player"}, {Key("list"), nestedTooDeep()}});
+  flush();
+  ASSERT_EQ(posts().count(), 1u);
+  EXPECT_EQ(postedNumbers(0), upTo(2));
+  EXPECT_TRUE(hasLines(log(), 2, "unable to handle key: list"));
 }
 
 TEST_F(HTTPSPostFlushTest, userInfoThatCameLaterIsInTheEventsThatWaited) {
@@ -284,7 +305,36 @@ TEST_F(HTTPSPostFlushTest, withoutAURLTheFlushFails) {
   const auto flushed = flush();
   EXPECT_EQ(flushed->error, failure("postURL is nil"));
   EXPECT_EQ(flushed->calls, 1);
+  EXPECT_TRUE(flushed->returned.has_value());
+  EXPECT_EQ(flushed->text, flushed->returned) << "the completion gets the text too";
   EXPECT_EQ(posts().count(), 0u);
+  process().locale().setCountryCode(String("FR"));
+  EXPECT_EQ(backend().updateState(), TelvaneBackendStateEnabled) << "the configuration is frozen";
+}
+
+// So a parent session enables a child whose own gates refused: the gates come before links, filters and lists.
+TEST_F(HTTPSPostFlushTest, aBackendThatAGateRefusedHasNowhereToSendWhenAnotherEnablesIt) {
+  process().locale().setCountryCode(String("FR"));
+  makeBackend();
+  EXPECT_EQ(backend().state(), TelvaneBackendStateDisabled);
+  backend().setState(TelvaneBackendStateEnabled);
+  sendMany(1);
+  send({}, 7, 2, kRealtimeFlag);
+  EXPECT_EQ(posts().count(), 0u);
+  sendMany(1);
+  EXPECT_EQ(flush()->error, failure("postURL is nil"));
+  EXPECT_EQ(posts().count(), 0u);
+}
+
+TEST_F(HTTPSPostFlushTest, aBackendKeepsItsConfigurationWhenALaterGateRefuses) {
+  _client.set(kClientEntryFilters, Array{Value(Dictionary{{kFilterKey, "n"}, {kFilterAction, "remove"}})});
+  makeBackend();
+  process().locale().setCountryCode(String("FR"));
+  EXPECT_EQ(backend().updateState(), TelvaneBackendStateDisabled);
+  backend().setState(TelvaneBackendStateEnabled);
+  sendMany(1);
+  flush();
+  EXPECT_FALSE(lastEvent().contains("n"));
 }
 
 TEST_F(HTTPSPostFlushTest, withoutAConnectivityHelperTheRequestIsDroppedSilently) {
@@ -338,6 +388,134 @@ TEST_F(HTTPSPostFlushTest, countsTheBytesThatWait) {
   EXPECT_GT(one, 100u);
   sendMany(1);
   EXPECT_EQ(backend().batchedEventsSize(), 2 * one);
+  send({{Key("text"), std::string(10'000, 'x')}, {Key("more"), 1}}, 8);
+  const uint64_t all = backend().batchedEventsSize();
+  EXPECT_GE(all, 2 * one + 10'000);
+  flush();
+  uint64_t estimate = 0;
+  for (const Value& event : posts().events(0)) estimate += objectSizeEstimate(event);
+  EXPECT_EQ(all, estimate);
+}
+
+TEST_F(HTTPSPostFlushTest, aFlushThatDiscardsLeavesTheCounts) {
+  makeBackend();
+  sendMany(30);
+  backend().setState(TelvaneBackendStateUnknown);
+  flush();
+  backend().setState(TelvaneBackendStateEnabled);
+  sendMany(20);
+  EXPECT_EQ(posts().count(), 0u);
+  sendMany(1);
+  ASSERT_EQ(posts().count(), 1u);
+  EXPECT_EQ(postedNumbers(0), upTo(20));
+}
+
+TEST_F(HTTPSPostFlushTest, eventsThatTakeMuchGoBeforeTheThreshold) {
+  makeBackend();
+  sendLarge(7);
+  EXPECT_EQ(posts().count(), 0u);
+  EXPECT_TRUE(hasNoLine(log(), "Flushing all batched events"));
+  sendLarge(1);
+  ASSERT_EQ(posts().count(), 1u);
+  EXPECT_EQ(posts().events(0).size(), 7u);
+  EXPECT_TRUE(hasLines(log(), 1, "HTTPSPostBackend(batchEvent): Flushing all batched events early as they take 7"));
+  flush();
+  ASSERT_EQ(posts().count(), 2u);
+  EXPECT_EQ(posts().events(1).size(), 1u) << "the event that found no room begins the next batch";
+}
+
+TEST_F(HTTPSPostFlushTest, anEarlyFlushBeginsTheCountOfItsEventAnew) {
+  makeBackend();
+  sendMany(40, 7);
+  sendLarge(7);
+  send({{Key("text"), std::string(2u << 20, 'x')}}, 7);
+  ASSERT_EQ(posts().count(), 1u);
+  EXPECT_EQ(posts().events(0).size(), 47u);
+  sendMany(49, 7);
+  EXPECT_EQ(posts().count(), 1u);
+  sendMany(1, 7);
+  ASSERT_EQ(posts().count(), 2u);
+  EXPECT_EQ(posts().events(1).size(), 50u);
+}
+
+TEST_F(HTTPSPostFlushTest, everyFlushCountsTheBytesAnew) {
+  makeBackend();
+  sendLarge(7);
+  flush();
+  sendLarge(7);
+  backend().setState(TelvaneBackendStateUnknown);
+  flush();
+  backend().setState(TelvaneBackendStateEnabled);
+  sendLarge(7);
+  EXPECT_EQ(posts().count(), 1u);
+  EXPECT_TRUE(hasNoLine(log(), "early"));
+}
+
+TEST_F(HTTPSPostFlushTest, oneEventLargerThanABatchWaitsAlone) {
+  makeBackend();
+  sendMany(1);
+  send({{Key("n"), 1}, {Key("text"), std::string(9u << 20, 'x')}});
+  ASSERT_EQ(posts().count(), 1u);
+  EXPECT_EQ(postedNumbers(0), upTo(1));
+  sendMany(1);
+  ASSERT_EQ(posts().count(), 2u);
+  EXPECT_EQ(postedNumbers(1), std::vector<int64_t>{1});
+}
+
+TEST_F(HTTPSPostFlushTest, anUndecidedBackendLosesWhatTakesTooMuch) {
+  makeBackend();
+  backend().setState(TelvaneBackendStateUnknown);
+  sendLarge(8);
+  EXPECT_TRUE(hasLines(log(), 1, "Flushing all batched events early"));
+  backend().setState(TelvaneBackendStateEnabled);
+  flush();
+  ASSERT_EQ(posts().count(), 1u);
+  EXPECT_EQ(posts().events(0).size(), 1u);
+}
+
+TEST_F(HTTPSPostFlushTest, withoutRequiredUserInfoTheNewestIsDroppedWithOneLinePerBurst) {
+  log().expectError("HTTPSPostBackend(batchEvent): Dropped 60 events, since those that wait took 7");
+  log().expectError("HTTPSPostBackend(batchEvent): Dropped 2 events, since those that wait took 7");
+  makeBackend();
+  for (const int tooMany : {60, 2}) {
+    const size_t before = posts().count();
+    backend().setUserInfoDict({});
+    sendLarge(7 + tooMany);
+    EXPECT_TRUE(hasNoLine(log(), fmt::format("Dropped {} events", tooMany))) << "the burst goes on";
+    EXPECT_TRUE(hasNoLine(log(), "Flushing all batched events"))
+        << "nothing to flush, and what is dropped does not count";
+    EXPECT_EQ(flush()->error, failure("Can not flush: userInfo is required"));
+    backend().setUserInfoDict(_userInfo);
+    flush();
+    ASSERT_EQ(posts().count(), before + 1);
+    EXPECT_EQ(posts().events(before).size(), 7u);
+    EXPECT_TRUE(hasLines(log(), 1, fmt::format("Dropped {} events", tooMany)));
+  }
+  sendLarge(8);
+  EXPECT_EQ(posts().count(), 3u) << "there is room again";
+}
+
+TEST_F(HTTPSPostFlushTest, aBackendThatEndsTellsWhatItDropped) {
+  log().expectError("HTTPSPostBackend(batchEvent): Dropped 1 events");
+  makeBackend();
+  backend().setUserInfoDict({});
+  sendLarge(8);
+  makeBackend();
+  EXPECT_TRUE(hasLines(log(), 1, "Dropped 1 events"));
+}
+
+// The body holds user info once for each event, which only shows when it has grown since the events were made.
+TEST_F(HTTPSPostFlushTest, userInfoThatHasGrownLeavesRoomForTheOldestEvents) {
+  log().expectError("HTTPSPostBackend(flushMessagesWithCompletion): Dropped 2 events, since each would take 11");
+  _client.set(kClientEntryFilters,
+              Array{Value(Dictionary{{kFilterKey, "blob"}, {kFilterMethod, 7}, {kFilterAction, "remove"}})});
+  makeBackend();
+  sendMany(4);
+  backend().setUserInfoDict(
+      Dictionary{{kTelvaneUserInfoClientName, "player"}, {Key("blob"), std::string(11u << 20, 'x')}});
+  flush();
+  ASSERT_EQ(posts().count(), 1u);
+  EXPECT_EQ(postedNumbers(0), upTo(2));
 }
 
 TEST_F(HTTPSPostFlushTest, aRealtimeEventFlushesALeftOverBatchOnlyWhenEnabled) {
