@@ -8,7 +8,7 @@
 
 namespace telvane {
 
-// Bounds the bytes of request bodies that wait for the network. The URL session adds and subtracts; the local
+// Bounds the bytes of requests (URL, headers and body) that wait for the network. The URL session adds and subtracts; the local
 // listener stops taking calls while the gate is closed and goes on when it opens, so a slow collector slows clients
 // and nothing is lost. Safe from any thread.
 class FlowGate {

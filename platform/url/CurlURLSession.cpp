@@ -179,7 +179,7 @@ void CurlURLSession::retry(CurlURLSessionTask* task) {
 void CurlURLSession::complete(Running& running, std::optional<Error> error) {
   const std::shared_ptr<CurlURLSessionTask> task = std::move(running.task);
   _running.erase(task.get());
-  task->releaseBody();
+  task->releaseRequest();
   if (_environment->flowGate != nullptr) _environment->flowGate->subtract(task->heldBytes());
   _events.didComplete(*task, std::move(error));
   {

@@ -5,11 +5,20 @@
 #include "platform/url/CurlURLSession.h"
 
 namespace telvane {
+namespace {
+
+uint64_t bytesOf(const URLRequest& request) {
+  uint64_t bytes = request.url.size();
+  for (const URLRequest::Header& header : request.headers) bytes += header.name.size() + header.value.size();
+  return bytes;
+}
+
+}  // namespace
 
 CurlURLSessionTask::CurlURLSessionTask(std::shared_ptr<CurlURLSession> session, URLRequest request,
                                        std::unique_ptr<UploadFile> file)
     : _session(std::move(session)),
-      _heldBytes(file ? 0 : request.body.size()),
+      _heldBytes(bytesOf(request) + (file ? 0 : request.body.size())),
       _request(std::move(request)),
       _file(std::move(file)) {}
 
@@ -18,8 +27,8 @@ void CurlURLSessionTask::resume() {
   if (!_isResumed.exchange(true, std::memory_order_relaxed)) _session->resume(shared_from_this());
 }
 
-void CurlURLSessionTask::releaseBody() {
-  _request.body = Data();
+void CurlURLSessionTask::releaseRequest() {
+  _request = URLRequest();
   _file = nullptr;
 }
 

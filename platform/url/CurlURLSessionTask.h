@@ -12,8 +12,8 @@ namespace telvane {
 
 class CurlURLSession;
 
-// One request of a CurlURLSession, which keeps it from resume until it has completed. Its body is let go of when it has
-// completed, whoever still holds the task.
+// One request of a CurlURLSession, which keeps it from resume until it has completed. The request is let go of when it
+// has completed, whoever still holds the task.
 //
 // The description is to be set before resume. The response belongs to the delegate queue.
 class CurlURLSessionTask final : public URLSessionTask, public std::enable_shared_from_this<CurlURLSessionTask> {
@@ -33,10 +33,11 @@ class CurlURLSessionTask final : public URLSessionTask, public std::enable_share
   const UploadFile* file() const noexcept { return _file.get(); }
   // The size of what is sent, wherever it comes from.
   uint64_t bodySize() const noexcept { return _file ? _file->size() : _request.body.size(); }
-  // The bytes of the body that are held in memory; constant, also when the body has gone.
+  // The bytes of URL, headers and body that are held in memory; constant, also when the request has gone. Headers
+  // count like the body: clients' names stand in them, at any length.
   uint64_t heldBytes() const noexcept { return _heldBytes; }
   // REQUIRES: the task has completed; on the loop's thread.
-  void releaseBody();
+  void releaseRequest();
 
   // REQUIRES: on the delegate queue.
   void setResponse(URLResponse response) { _response = std::move(response); }

@@ -313,18 +313,32 @@ TEST_F(CurlURLSessionTest, cancelsItsTasksWhenItsProviderEnds) {
   EXPECT_TRUE(delegate().waitUntilInvalid());
 }
 
-TEST_F(CurlURLSessionTest, countsABodyInTheFlowGateFromResumeToCompletion) {
+TEST_F(CurlURLSessionTest, countsARequestInTheFlowGateFromResumeToCompletion) {
   givenAnswersByTheTest();
+  const uint64_t urlSize = url().size();
   const auto made = *session().newDataTask(post(url(), std::string(1000, 'x')));
   EXPECT_EQ(_gate.bytes(), 0u);
   made->resume();
-  EXPECT_EQ(_gate.bytes(), 1000u);
+  EXPECT_EQ(_gate.bytes(), urlSize + 1000);
   const auto other = start(post(url(), std::string(500, 'y')));
   const auto responders = waitForRequests(2);
-  EXPECT_EQ(_gate.bytes(), 1500u);
+  EXPECT_EQ(_gate.bytes(), 2 * urlSize + 1500);
   for (const auto& responder : responders) responder->send({});
   delegate().waitFor(made);
   delegate().waitFor(other);
+  EXPECT_EQ(_gate.bytes(), 0u);
+}
+
+// Clients' names stand in headers, at any length.
+TEST_F(CurlURLSessionTest, countsHeadersInTheFlowGateLikeTheBody) {
+  givenAnswersByTheTest();
+  URLRequest request = post(url(), "body");
+  request.setHeader("X-Name", std::string(5000, 'n'));
+  request.setHeader("X-Other", "12");
+  const auto task = start(std::move(request));
+  EXPECT_EQ(_gate.bytes(), url().size() + 4 + 6 + 5000 + 7 + 2);
+  waitForRequests(1).front()->send({});
+  delegate().waitFor(task);
   EXPECT_EQ(_gate.bytes(), 0u);
 }
 
@@ -333,7 +347,7 @@ TEST_F(CurlURLSessionTest, doesNotCountAFileInTheFlowGate) {
   const std::string path = _folder.write("container", std::string(1000, 'f'));
   const auto task = *session().newUploadTask(post(url(), "x"), path);
   task->resume();
-  EXPECT_EQ(_gate.bytes(), 0u);
+  EXPECT_EQ(_gate.bytes(), url().size());
   waitForRequests(1).front()->send({});
   EXPECT_FALSE(delegate().waitFor(task).error.has_value());
   EXPECT_EQ(_gate.bytes(), 0u);
