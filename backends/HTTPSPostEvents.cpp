@@ -278,9 +278,8 @@ HTTPSPostBackend::FlushResult HTTPSPostBackend::flushOnStateQueue(FlushCompletio
   log().message("HTTPSPostBackend(flushMessagesWithCompletion): called");
   std::optional<Dictionary> userInfo = _userInfoDict;
   if (userInfo.has_value()) _filters.filterEvent(*userInfo);
-  std::vector<Dictionary> events = takeBatch();
+  std::vector<Dictionary> events = takeListedEvents(takeBatch(), userInfo);
   leaveRoomForUserInfo(events, userInfo);
-  events = takeListedEvents(std::move(events), userInfo);
   _eventMethodCounts.clear();
   std::optional<PostMessage> message;
   if (!events.empty()) message = createMessageForPostAndLogging(std::move(events));
