@@ -37,6 +37,7 @@ Dictionary TelvanedAgent::daemonStatus() {
   MonitorLock lock(*_monitor);
   status.set(kStatusSessions, Value(_sessionList.size()));
   status.set(kStatusHierarchies, Value(_correlatedSessions.size()));
+  status.set(kStatusSharedData, Value(_sharedData.size()));
   status.set(kStatusTransactions, Value(_xpcTransactionReference));
   Dictionary clientTypes;
   for (const ClientType& row : allClientTypes()) {

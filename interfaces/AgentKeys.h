@@ -18,6 +18,8 @@ inline constexpr Key kStatusUptimeSeconds{"uptimeSeconds"};
 inline constexpr Key kStatusSessions{"sessions"};
 inline constexpr Key kStatusClientTypes{"clientTypes"};
 inline constexpr Key kStatusHierarchies{"hierarchies"};
+// How many hierarchies have shared data.
+inline constexpr Key kStatusSharedData{"sharedData"};
 inline constexpr Key kStatusTransactions{"transactions"};
 inline constexpr Key kStatusConnectivityHelpers{"connectivityHelpers"};
 // Storebag name -> {state, version, ageSeconds, maxAgeSeconds}.
