@@ -36,8 +36,11 @@ class FileSystem {
   // When the file or folder was made; a symbolic link is not followed. Nothing when there is none, or when the system
   // does not tell.
   virtual std::optional<Date> creationDate(const std::string& path) const = 0;
+  // Names of the regular files in the folder itself, in ascending order; symbolic links are left out. What is in its
+  // subfolders is not looked at.
+  virtual Result<std::vector<std::string>> filesIn(const std::string& path) const = 0;
   // Paths of all regular files below the folder at any depth, relative to it, in ascending order; symbolic links are
-  // not followed.
+  // not followed. A subfolder that this user may not read counts as empty; for the folder itself that is an error.
   virtual Result<std::vector<std::string>> filesBelow(const std::string& path) const = 0;
   // Makes the file or folder readable without the user's key, where the platform protects files by class. A plain
   // success where it does not.

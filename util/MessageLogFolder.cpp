@@ -37,7 +37,7 @@ bool MessageLogFolder::isMessageLog(std::string_view name) {
 
 std::vector<std::string> MessageLogFolder::messageLogs() {
   std::vector<std::string> paths;
-  const Result<std::vector<std::string>> names = _platform.files.filesBelow(_path);
+  const Result<std::vector<std::string>> names = _platform.files.filesIn(_path);
   if (names.has_value()) {
     for (const std::string& name : *names) {
       if (isMessageLog(name)) paths.push_back(_path + "/" + name);
@@ -55,6 +55,11 @@ std::vector<std::string> MessageLogFolder::messageLogs() {
   return paths;
 }
 
+bool MessageLogFolder::hasFile(const std::string& name) const {
+  const Result<std::vector<std::string>> names = _platform.files.filesIn(_path);
+  return names.has_value() && std::binary_search(names->begin(), names->end(), name);
+}
+
 void MessageLogFolder::createNewLogFile(std::optional<std::string>* logFilePath,
                                         std::optional<Date>* logFileCreationDate) {
   if (logFilePath == nullptr || logFileCreationDate == nullptr) {
@@ -63,10 +68,12 @@ void MessageLogFolder::createNewLogFile(std::optional<std::string>* logFilePath,
   }
   logFilePath->reset();
   logFileCreationDate->reset();
-  std::string path = fmt::format("{}/{}_{}_{}", _path, kFirstPart, timeForName(_platform), kLastPart);
+  const std::string name = fmt::format("{}_{}_{}", kFirstPart, timeForName(_platform), kLastPart);
+  std::string path = _path + "/" + name;
   const Result<void> made = _platform.submittableLogs.createTemporaryLog(kLogType, path);
   // What counts is that there is a file, also one that was there before.
-  if (!_platform.files.modificationDate(path).has_value()) {
+  const bool isThere = made.has_value() ? _platform.files.modificationDate(path).has_value() : hasFile(name);
+  if (!isThere) {
     if (!made) _platform.log.error("createNewLogFile: {}", made.error());
     _platform.log.error("writeToLogFile: Failed to create new telvaned log file {}", path);
     return;

@@ -29,8 +29,8 @@ class MessageLogFolder {
   // Whether a file of that name is a message log of the daemon: "telvaned_TIME_messageLog.ips".
   static bool isMessageLog(std::string_view name);
 
-  // Returns the paths of the daemon's files, in ascending order. A folder that is not there is made. When it cannot be
-  // read, that is logged and there are none.
+  // Returns the paths of the daemon's files, in ascending order; subfolders are not looked into. A folder that is not
+  // there is made. When it cannot be read, that is logged and there are none.
   std::vector<std::string> messageLogs();
   // Makes a file named after the time and sets both to it; to nothing, with an error line, when it cannot be made. The
   // creation date is the one that the file system tells, if it does. With a null pointer it only logs the error.
@@ -39,6 +39,9 @@ class MessageLogFolder {
   void deleteExpiredLogFile(const std::string& path, const std::optional<Date>& creationDate);
 
  private:
+  // Whether a regular file of that name is there. A link is none: what it leads to is not ours to write.
+  bool hasFile(const std::string& name) const;
+
   Platform& _platform;
   const std::string _path;
 };

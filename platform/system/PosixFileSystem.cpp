@@ -69,11 +69,32 @@ std::optional<Date> PosixFileSystem::creationDate(const std::string& path) const
   return creationDateOf(status);
 }
 
+Result<std::vector<std::string>> PosixFileSystem::filesIn(const std::string& path) const {
+  const std::string folder = resolve(path);
+  std::error_code failure;
+  std::vector<std::string> names;
+  fs::directory_iterator entry(folder, failure);
+  while (!failure && entry != fs::directory_iterator()) {
+    std::error_code gone;  // an entry may vanish while we look
+    if (entry->symlink_status(gone).type() == fs::file_type::regular)
+      names.push_back(entry->path().filename().string());
+    entry.increment(failure);
+  }
+  if (failure) return errnoError(failure.value(), "Cannot list " + folder);
+  std::sort(names.begin(), names.end());
+  return names;
+}
+
 Result<std::vector<std::string>> PosixFileSystem::filesBelow(const std::string& path) const {
   const std::string folder = resolve(path);
   std::error_code failure;
   std::vector<std::string> files;
-  fs::recursive_directory_iterator entry(folder, fs::directory_options::skip_permission_denied, failure);
+  // Passing over what may not be read holds for subfolders; the folder that was asked for must be readable.
+  fs::directory_iterator top(folder, failure);
+  fs::recursive_directory_iterator entry;
+  if (!failure) {
+    entry = fs::recursive_directory_iterator(folder, fs::directory_options::skip_permission_denied, failure);
+  }
   while (!failure && entry != fs::recursive_directory_iterator()) {
     std::error_code gone;  // an entry may vanish while we look
     if (entry->symlink_status(gone).type() == fs::file_type::regular) {

@@ -21,6 +21,7 @@ class PosixFileSystem final : public FileSystem {
   Result<void> remove(const std::string& path) override;
   std::optional<Date> modificationDate(const std::string& path) const override;
   std::optional<Date> creationDate(const std::string& path) const override;
+  Result<std::vector<std::string>> filesIn(const std::string& path) const override;
   Result<std::vector<std::string>> filesBelow(const std::string& path) const override;
   // Files are protected by their permissions here, not by class, so there is nothing to do.
   Result<void> setProtectionNone(const std::string& path) override;

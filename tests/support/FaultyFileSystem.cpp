@@ -99,6 +99,11 @@ std::optional<Date> FaultyFileSystem::creationDate(const std::string& path) cons
   return _target.creationDate(path);
 }
 
+Result<std::vector<std::string>> FaultyFileSystem::filesIn(const std::string& path) const {
+  if (auto fault = readFault(path)) return *std::move(fault);
+  return _target.filesIn(path);
+}
+
 Result<std::vector<std::string>> FaultyFileSystem::filesBelow(const std::string& path) const {
   if (auto fault = readFault(path)) return *std::move(fault);
   return _target.filesBelow(path);

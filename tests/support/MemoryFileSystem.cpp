@@ -147,6 +147,14 @@ std::optional<Date> MemoryFileSystem::creationDate(const std::string& path) cons
   return std::nullopt;
 }
 
+Result<std::vector<std::string>> MemoryFileSystem::filesIn(const std::string& path) const {
+  Result<std::vector<std::string>> files = filesBelow(path);
+  if (files.has_value()) {
+    std::erase_if(*files, [](const std::string& file) { return file.find('/') != std::string::npos; });
+  }
+  return files;
+}
+
 Result<std::vector<std::string>> MemoryFileSystem::filesBelow(const std::string& path) const {
   const std::string resolved = resolve(path);
   MutexLock lock(_mutex);

@@ -30,6 +30,7 @@ class MemoryFileSystem final : public FileSystem {
   Result<void> remove(const std::string& path) override;
   std::optional<Date> modificationDate(const std::string& path) const override;
   std::optional<Date> creationDate(const std::string& path) const override;
+  Result<std::vector<std::string>> filesIn(const std::string& path) const override;
   Result<std::vector<std::string>> filesBelow(const std::string& path) const override;
   Result<void> setProtectionNone(const std::string& path) override;
 

@@ -116,6 +116,10 @@ TEST_F(MemoryFileSystemTest, listsFilesBelowAFolderInOrder) {
   const auto files = _files.filesBelow("/var");
   ASSERT_TRUE(isOk(files));
   EXPECT_THAT(*files, ElementsAre("a/b/c", "a/z", "b"));
+  const auto names = _files.filesIn("/var");
+  ASSERT_TRUE(isOk(names));
+  EXPECT_THAT(*names, ElementsAre("b"));
+  EXPECT_TRUE(isError(_files.filesIn("/var/absent"), ENOENT));
 }
 
 TEST_F(MemoryFileSystemTest, remembersWhatIsUnprotected) {

@@ -89,6 +89,15 @@ TEST_F(MessageLogFileTest, aMessageKeepsItsLineFeedsAndBraces) {
   EXPECT_EQ(content(newYear), "(2026-01-01 00:00:00 +0000) [backend] {\n  \"events\" : [ {} ]\n}\n");
 }
 
+TEST_F(MessageLogFileTest, whatIsInSubfoldersIsNotTheDaemons) {
+  givenFile("telvaned_sub/x_messageLog.ips", 25h);
+  givenFile("telvaned_sub/y_messageLog.ips", 1h);
+  write();
+  EXPECT_THAT(files(), ElementsAre(newYear, "telvaned_sub/x_messageLog.ips", "telvaned_sub/y_messageLog.ips"));
+  EXPECT_EQ(content("telvaned_sub/y_messageLog.ips"), "earlier\n");
+  EXPECT_THAT(submitted(), IsEmpty());
+}
+
 TEST_F(MessageLogFileTest, aRestartedDaemonGoesOnWithTheFileOfTheDay) {
   write("one");
   advance(23h);

@@ -3,6 +3,7 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -31,6 +32,24 @@ class PosixFileSystemTest : public ::testing::Test {
     }
     std::sort(names.begin(), names.end());
     return names;
+  }
+
+  // Asks in a process of its own that has no rights beyond a user's; returns the answer, 0 to 255, or -1.
+  template <class Question>
+  static int asNobody(Question&& question) {
+    constexpr uid_t kNobody = 65534;
+    const pid_t child = ::fork();
+    if (child == 0) {
+      if (::geteuid() == 0 && ::setuid(kNobody) != 0) ::_exit(255);
+      ::_exit(question());
+    }
+    int status = 0;
+    if (child < 0 || ::waitpid(child, &status, 0) != child || !WIFEXITED(status)) return -1;
+    return WEXITSTATUS(status);
+  }
+  template <class T>
+  static int errorOf(const Result<T>& result) {
+    return result.has_value() ? 0 : static_cast<int>(result.error().code());
   }
 
   testing::ScratchFolder _folder;
@@ -143,6 +162,30 @@ TEST_F(PosixFileSystemTest, listsRegularFilesAtAnyDepthInOrder) {
   ASSERT_TRUE(succeeds(files));
   EXPECT_EQ(*files, (std::vector<std::string>{"a/b/c", "a/z", "b"}));
   EXPECT_TRUE(failsWith(_files.filesBelow(_folder.at("none")), ENOENT));
+}
+
+TEST_F(PosixFileSystemTest, listsTheFilesOfOneFolderWithoutItsSubfolders) {
+  for (const char* path : {"top/b", "top/a", "top/below/c"}) _folder.write(path, "x");
+  std::filesystem::create_symlink(_folder.at("top/b"), _folder.at("top/link"));
+  const Result<std::vector<std::string>> names = _files.filesIn(_folder.at("top"));
+  ASSERT_TRUE(succeeds(names));
+  EXPECT_EQ(*names, (std::vector<std::string>{"a", "b"}));
+  EXPECT_TRUE(failsWith(_files.filesIn(_folder.at("none")), ENOENT));
+  EXPECT_TRUE(failsWith(_files.filesIn(_folder.at("top/b")), ENOTDIR));
+}
+
+// A folder that may not be read once passed for an empty one, so its files were neither found nor missed.
+TEST_F(PosixFileSystemTest, aFolderThatMayNotBeReadIsNoEmptyOne) {
+  _folder.write("top/closed/file", "x");
+  _folder.write("top/open", "x");
+  chmod(_folder.path().c_str(), 0755);
+  chmod(_folder.at("top/closed").c_str(), 0);
+  const std::string closed = _folder.at("top/closed");
+  EXPECT_EQ(asNobody([&] { return errorOf(_files.filesIn(closed)); }), EACCES);
+  EXPECT_EQ(asNobody([&] { return errorOf(_files.filesBelow(closed)); }), EACCES);
+  const auto otherFiles = [&] { return static_cast<int>(_files.filesBelow(_folder.at("top"))->size()); };
+  EXPECT_EQ(asNobody(otherFiles), 1) << "a closed subfolder hides only what is in it";
+  chmod(closed.c_str(), 0755);
 }
 
 TEST_F(PosixFileSystemTest, livesBelowTheRootOfItsInstance) {
