@@ -101,7 +101,7 @@ constexpr StorebagKey kClientEntryKeys[] = {
      "Which of the devices that sampling left out may still be promoted.",
      "A device whose number is below it keeps its events, and sends them after a promoting message (flag 2 or 3); the "
      "others are disabled. Looked at only when the number is not below the sampling threshold."},
-    {kClientEntryCustomClientId, Shape::Any, Optional, "the device's identifier",
+    {kClientEntryCustomClientId, Shape::Any, Optional, "an identifier of the user on the device",
      "Report under an identifier of the client and service alone.",
      "It is enough that the key is there; its value is not looked at."},
     {kClientEntryEventThreshold, Shape::EventThreshold, Optional, "49",
