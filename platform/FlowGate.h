@@ -8,9 +8,9 @@
 
 namespace telvane {
 
-// Bounds the bytes of requests (URL, headers and body) that wait for the network. The URL session adds and subtracts; the local
-// listener stops taking calls while the gate is closed and goes on when it opens, so a slow collector slows clients
-// and nothing is lost. Safe from any thread.
+// Bounds the bytes of requests that wait for the network: URLs, headers, bodies. The URL session adds and subtracts;
+// the local listener stops taking calls while the gate is closed and goes on when it opens, so a slow collector slows
+// clients and nothing is lost. Safe from any thread.
 class FlowGate {
  public:
   static constexpr uint64_t kDefaultLimit = 32ull << 20;
