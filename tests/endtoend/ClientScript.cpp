@@ -116,6 +116,16 @@ ClientScript& ClientScript::open(Dictionary sessionInfo, Value userInfo) {
   return add("open", std::move(arguments));
 }
 
+ClientScript& ClientScript::openAggregating(Dictionary sessionInfo, Value userInfo, const char* reaction) {
+  Dictionary arguments;
+  arguments.set(kSessionInfo, std::move(sessionInfo));
+  arguments.set(kUserInfo, std::move(userInfo));
+  arguments.set(kReaction, reaction);
+  return add("openAggregating", std::move(arguments));
+}
+
+ClientScript& ClientScript::letGo() { return add("letGo"); }
+
 ClientScript& ClientScript::configure() { return add("configure"); }
 
 ClientScript& ClientScript::fetchStates(Value userInfo) {
@@ -131,6 +141,16 @@ ClientScript& ClientScript::send(uint16_t category, uint16_t type, Value payload
   arguments.set(kPayload, std::move(payload));
   arguments.set(kFlag, flag);
   return add("send", std::move(arguments));
+}
+
+ClientScript& ClientScript::sendMany(uint16_t category, const std::string& from, int count, int first, int textSize) {
+  Dictionary arguments;
+  arguments.set(kCategory, category);
+  arguments.set(kFrom, from);
+  arguments.set(kCount, count);
+  arguments.set(kFirst, first);
+  arguments.set(kTextSize, textSize);
+  return add("sendMany", std::move(arguments));
 }
 
 ClientScript& ClientScript::flush() { return add("flush"); }

@@ -16,11 +16,19 @@ namespace telvane::testing {
 class ClientScript {
  public:
   ClientScript& open(Dictionary sessionInfo, Value userInfo = {});
+  // Opens a session that takes the messages of those below it: "aggregated: CATEGORY TYPE FROM N" for each, the last
+  // two from its payload, and "aggregated: end" when it hears no more. For one of category 21 it then does as told: ""
+  // for nothing, "send" (the payload once more under category 30, and a flush), "let go" or "throw".
+  ClientScript& openAggregating(Dictionary sessionInfo, Value userInfo, const char* reaction = "");
+  // Lets the session go.
+  ClientScript& letGo();
   // "configured: [names]", or "configured: nothing".
   ClientScript& configure();
   // "states: [names]", or "states: nothing".
   ClientScript& fetchStates(Value userInfo);
   ClientScript& send(uint16_t category, uint16_t type, Value payload = {}, uint32_t flag = 0);
+  // Sends so many events with a payload of "from", "n" counted from the first number on, and a "text" of so many bytes.
+  ClientScript& sendMany(uint16_t category, const std::string& from, int count, int first = 0, int textSize = 0);
   // "flushed: ok", or "flushed: error CODE TEXT".
   ClientScript& flush();
   ClientScript& share(Dictionary sharedData);
@@ -43,6 +51,11 @@ class ClientScript {
   static constexpr char kFlag[] = "flag";
   static constexpr char kKey[] = "key";
   static constexpr char kAlgorithm[] = "algorithm";
+  static constexpr char kReaction[] = "reaction";
+  static constexpr char kFrom[] = "from";
+  static constexpr char kCount[] = "count";
+  static constexpr char kFirst[] = "first";
+  static constexpr char kTextSize[] = "textSize";
 
  private:
   ClientScript& add(const char* name, Dictionary arguments = {});

@@ -63,6 +63,11 @@ void ChildProcess::signal(int number) {
   if (_pid > 0) kill(_pid, number);
 }
 
+void ChildProcess::writeLine() {
+  if (_input < 0 || !isRunning()) return;
+  if (write(_input, "\n", 1) != 1) throw std::runtime_error("a child process takes no input");
+}
+
 void ChildProcess::closeInput() {
   if (_input >= 0) close(std::exchange(_input, -1));
 }

@@ -25,6 +25,8 @@ class ChildProcess {
 
   pid_t pid() const noexcept { return _pid; }
   void signal(int number);
+  // Writes an empty line to its standard input; does nothing when it has ended.
+  void writeLine();
   void closeInput();
   bool isRunning();
   // Waits until it has ended, so long at most (it is killed then); returns the exit status, minus the signal's number
