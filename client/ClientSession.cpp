@@ -2,10 +2,10 @@
 
 #include <algorithm>
 
-#include "client/FileURL.h"
 #include "client/SessionInfoValidation.h"
 #include "client/ValueSize.h"
 #include "interfaces/BackendNames.h"
+#include "interfaces/FileURL.h"
 #include "interfaces/SessionKeys.h"
 #include "interfaces/TelvaneErrors.h"
 #include "platform/process/FileExtension.h"

@@ -1,6 +1,7 @@
 // The road of a message through a session: aggregation, backends, flushes, uploads, shared data.
 #include "daemon/session/TelvanedSession.h"
 #include "interfaces/BackendNames.h"
+#include "interfaces/FileURL.h"
 #include "interfaces/SessionKeys.h"
 #include "interfaces/TelvaneErrors.h"
 
@@ -191,9 +192,7 @@ void TelvanedSession::internalFlushMessagesWithCompletion(FlushReply completion)
 void TelvanedSession::uploadFileAtPath(String fileURL, int extensionToken,
                                        UniqueFunction<void(bool)> completionHandler) {
   log().message("uploadFileAtPath: Uploading file for session {}", _sessionID);
-  constexpr std::string_view kFileScheme = "file://";
-  std::string_view path = fileURL;
-  if (path.starts_with(kFileScheme)) path.remove_prefix(kFileScheme.size());
+  const std::string path = pathOfFileURL(fileURL);
   bool success = false;
   if (_backends.has_value()) {
     for (const auto& [name, backend] : *_backends) {

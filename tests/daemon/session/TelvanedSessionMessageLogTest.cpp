@@ -125,9 +125,9 @@ TEST_F(TelvanedSessionMessageLogTest, aOneShotMessageIsWrittenWhenItGoesAtOnce) 
 
 TEST_F(TelvanedSessionMessageLogTest, anUploadIsWrittenWithItsURLWhateverCameOfIt) {
   const auto client = openSession();
-  log().expectError("uploadFileWithURL: File upload failed for /tmp/log");
-  client->ask(ClientSessionOperation::UploadFileAtPath, {"file:///tmp/log"});
-  EXPECT_EQ(messageLog(), std::string(kDate) + "[uploadFileWithURL] Upload failed for file file:///tmp/log\n");
+  log().expectError("uploadFileWithURL: File upload failed for /tmp/a log");
+  client->ask(ClientSessionOperation::UploadFileAtPath, {"file:///tmp/a%20log"});
+  EXPECT_EQ(messageLog(), std::string(kDate) + "[uploadFileWithURL] Upload failed for file file:///tmp/a%20log\n");
 }
 
 TEST_F(TelvanedSessionMessageLogTest, aURLCannotMakeLinesOfTheLog) {

@@ -1,4 +1,4 @@
-#include "client/FileURL.h"
+#include "interfaces/FileURL.h"
 
 #include <charconv>
 
