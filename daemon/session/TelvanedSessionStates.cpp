@@ -8,11 +8,12 @@
 namespace telvane {
 namespace {
 
+// Numbers as the backends read them when they look an event up: equal for them is equal here.
 Value distinctCategories(const Array& categories) {
-  std::set<int64_t> seen;
+  std::set<int32_t> seen;
   Array distinct;
   for (const Value& category : categories) {
-    if (seen.insert(category.integerValue()).second) distinct.append(category);
+    if (seen.insert(category.int32Value()).second) distinct.append(category);
   }
   return distinct;
 }
@@ -76,11 +77,11 @@ Value TelvanedSession::fetchBlacklistedEvents() const {
       common = *blacklist;
       continue;
     }
-    std::set<int64_t> barred;
-    for (const Value& category : *blacklist) barred.insert(category.integerValue());
+    std::set<int32_t> barred;
+    for (const Value& category : *blacklist) barred.insert(category.int32Value());
     Array both;
     for (const Value& category : *common) {
-      if (barred.contains(category.integerValue())) both.append(category);
+      if (barred.contains(category.int32Value())) both.append(category);
     }
     common = std::move(both);
   }

@@ -75,6 +75,14 @@ TEST_F(TelvanedSessionStatesTest, theBlacklistIsTheIntersection) {
   EXPECT_EQ(setOf(startWith({blacklisting({1, 2}), blacklisting({2, 3})})[2]), (Categories{2}));
 }
 
+TEST_F(TelvanedSessionStatesTest, numbersThatAreEqualToBackendsAreEqualInTheLists) {
+  constexpr int64_t kSevenAndMore = (int64_t{1} << 32) + 7;
+  EXPECT_EQ(startWith({whitelisting({7}), whitelisting({kSevenAndMore, 7.5, "7"})})[1].array()->size(), 1u);
+  world.advance(std::chrono::seconds(1));
+  const Answer answer = startWith({blacklisting({7}), blacklisting({kSevenAndMore})});
+  EXPECT_EQ(setOf(answer[2]), (Categories{7}));
+}
+
 TEST_F(TelvanedSessionStatesTest, aCollectorWithoutABlacklistDoesNotCount) {
   EXPECT_EQ(setOf(startWith({StorebagBuilder::permissiveClient(), blacklisting({5})})[2]), (Categories{5}));
 }
@@ -89,6 +97,21 @@ TEST_F(TelvanedSessionStatesTest, withoutBackendsAllThreeAreAbsent) {
   ASSERT_TRUE(answer.values.has_value());
   for (size_t i = 0; i < 3; ++i) EXPECT_EQ(answer[i], Value());
   EXPECT_TRUE(hasLine(log(), "fetchStatesWithUserInfo: Fetching states for session 42"));
+}
+
+TEST_F(TelvanedSessionStatesTest, listsCountWhateverTheStateOfTheirBackend) {
+  Dictionary disabledWithWhitelist = whitelisting({1, 2});
+  disabledWithWhitelist.set(kClientEntrySamplingThreshold, Value());
+  Answer answer = startWith({disabledWithWhitelist, whitelisting({2, 3})});
+  EXPECT_EQ(answer[0], Value(Array{"splunk2"}));
+  EXPECT_EQ(setOf(answer[1]), (Categories{1, 2, 3}));
+
+  Dictionary disabledWithBlacklist = blacklisting({1, 2});
+  disabledWithBlacklist.set(kClientEntrySamplingThreshold, Value());
+  world.advance(std::chrono::seconds(1));
+  answer = startWith({disabledWithBlacklist, blacklisting({2, 3})});
+  EXPECT_EQ(answer[0], Value(Array{"splunk2"}));
+  EXPECT_EQ(setOf(answer[2]), (Categories{2}));
 }
 
 TEST_F(TelvanedSessionStatesTest, anEmptySectionIsAsGoodAsNone) {
