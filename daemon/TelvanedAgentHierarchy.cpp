@@ -143,7 +143,9 @@ void TelvanedAgent::updateDownstreamSessions(TelvanedSession& session) {
   if (hasAncestor) session.shutdownSessionAggregation();
   CorrelatedSessions* list = correlatedSessions(*token);
   if (list == nullptr) return;
-  const bool isAggregated = hasAncestor || session.hasAggregator();
+  // Levels below 0 are nobody's ancestors: what lies above must not fall silent for an aggregator that would hear
+  // nothing.
+  const bool isAggregated = hasAncestor || (session.hasAggregator() && session.hierarchyLevel() >= 0);
   for (const auto& weak : *list) {
     const auto descendant = weak.lock();
     if (descendant == nullptr || descendant->hierarchyLevel() <= session.hierarchyLevel()) continue;

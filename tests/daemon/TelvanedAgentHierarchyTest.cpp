@@ -287,6 +287,15 @@ TEST_F(TelvanedAgentHierarchyTest, anAbsurdLevelCostsNoMoreThanTheSessionsThereA
   EXPECT_EQ(aggregatorOf(3), 0u);
 }
 
+TEST_F(TelvanedAgentHierarchyTest, anAggregatorBelowLevel0SilencesNobody) {
+  givenStorebag();
+  givenLevels({0, 1, -1}, {0, 2});
+  for (const auto& client : clients) client->start();
+  EXPECT_TRUE(kept[0]->hasAggregator());
+  clients[1]->send(7);
+  EXPECT_EQ(clients[0]->aggregated().back()[2], Value(7));
+}
+
 TEST_F(TelvanedAgentHierarchyTest, anAbsurdLevelReportsAndAggregatesLikeAnyOther) {
   givenStorebag();
   givenLevels({INT32_MIN, 0, INT32_MAX, INT32_MAX - 1}, {1, 2});
