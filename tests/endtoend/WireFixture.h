@@ -55,6 +55,7 @@ class WireFixture : public ::testing::Test {
   void expectEnd(ChildProcess& client);
 
   Instance& instance() { return _instance; }
+  const Instance& instance() const { return _instance; }
   WireServer& server() const { return *_server; }
   std::vector<WireRequest> posts() const { return _server->posts(); }
   // A post's body as it was before compression; fails the test when it cannot be inflated.
