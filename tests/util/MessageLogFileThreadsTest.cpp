@@ -48,22 +48,7 @@ class MessageLogFileThreadsTest : public ::testing::Test {
   }
   // All writers at once, until all that they have to say is said.
   void writeFromAllThreads(Clock& clock) {
-    const Platform& base = world.makeProcess("telvaned").platform();
-    Platform platform{clock,
-                      base.random,
-                      dispatch,
-                      log,
-                      files,
-                      base.userDefaults,
-                      base.deviceAnswers,
-                      base.locale,
-                      base.consent,
-                      base.clientBundle,
-                      base.urlSessions,
-                      base.transactions,
-                      base.localService,
-                      submittableLogs,
-                      base.processMemory};
+    Platform platform = realFilesPlatform(clock);
     MessageLogFile messageLog(platform);
     const auto queue = dispatch.newConcurrentQueue("writers", QualityOfService::Default);
     const auto done = dispatch.newSemaphore(0);
@@ -74,6 +59,25 @@ class MessageLogFileThreadsTest : public ::testing::Test {
       });
     }
     for (int writer = 0; writer < kWriters; ++writer) ASSERT_TRUE(done->waitFor(60s));
+  }
+  // Of the system: files, threads and the clock that is given.
+  Platform realFilesPlatform(Clock& clock) {
+    const Platform& base = world.makeProcess("telvaned").platform();
+    return Platform{clock,
+                    base.random,
+                    dispatch,
+                    log,
+                    files,
+                    base.userDefaults,
+                    base.deviceAnswers,
+                    base.locale,
+                    base.consent,
+                    base.clientBundle,
+                    base.urlSessions,
+                    base.transactions,
+                    base.localService,
+                    submittableLogs,
+                    base.processMemory};
   }
   // The messages of all lines of all files of the folder, which must be whole; how often each came.
   std::map<std::string, int> messagesIn(const std::string& path) {
@@ -118,6 +122,24 @@ TEST_F(MessageLogFileThreadsTest, linesOfConcurrentWritersStandWhole) {
   expectEachOnce(messagesIn(kRetired));
   EXPECT_TRUE(hasLines(log, 1, "Created new telvaned log file"));
   EXPECT_TRUE(hasLines(log, kWriters * kMessages, "Saved log message to"));
+}
+
+// Whoever may write into the folder could otherwise choose which file the daemon writes to, or have it write nowhere.
+TEST_F(MessageLogFileThreadsTest, aLinkOfTheNewFilesNameIsNotTaken) {
+  SteppingClock clock(0s, 0h);
+  Platform platform = realFilesPlatform(clock);
+  MessageLogFolder folder(platform);
+  std::optional<std::string> path;
+  std::optional<Date> date;
+  folder.createNewLogFile(&path, &date);
+  ASSERT_TRUE(path.has_value());
+  const std::string target = scratch.write("target", "");
+  fs::remove(*path);
+  fs::create_symlink(target, *path);
+  log.expectError("createNewLogFile: ");
+  log.expectError("writeToLogFile: Failed to create new telvaned log file " + *path);
+  folder.createNewLogFile(&path, &date);
+  EXPECT_EQ(path, std::nullopt);
 }
 
 // Each call finds its file expired, so files come and go under all writers.

@@ -187,6 +187,16 @@ TEST_F(TelvanedSessionMessagesTest, uploadsThatNoBackendTakesFail) {
   EXPECT_TRUE(hasLine(log(), "uploadFileAtPath: Uploading file for session 42"));
 }
 
+TEST_F(TelvanedSessionMessagesTest, anUploadIsOfThePathThatTheURLNames) {
+  const auto client = openSession();
+  for (const char* url : {"file:///tmp/a%20log", "file://localhost/tmp/a%20log", "file:///tmp/a%20log?x#y"}) {
+    log().clear();
+    log().expectError("uploadFileWithURL: File upload failed for /tmp/a log");
+    EXPECT_EQ(client->ask(ClientSessionOperation::UploadFileAtPath, {url})[0], Value(false)) << url;
+    EXPECT_TRUE(hasLines(log(), 1, "uploadFileWithURL: File upload failed for /tmp/a log")) << url;
+  }
+}
+
 TEST_F(TelvanedSessionMessagesTest, uploadsWithoutBackendsFailToo) {
   const auto client = openSession();
   log().expectError("uploadFileWithURL: File upload failed for /tmp/log");
@@ -243,8 +253,24 @@ TEST_F(TelvanedSessionMessagesTest, theRootsAggregatorHearsAChildsMessagesAndThe
   child->send(7);
   ASSERT_EQ(root->aggregated().size(), before + 1);
   EXPECT_EQ(root->aggregated().back()[0], Value(sessionInfoIn("a", 1, 2)));
-  // All that the child's own one heard is that it has ended.
-  for (const Array& call : child->aggregated()) EXPECT_EQ(call[2], Value(0));
+  ASSERT_EQ(child->aggregated().size(), 1u) << "that aggregation has ended for it";
+  const Array& end = child->aggregated()[0];
+  EXPECT_EQ(end[0], Value());
+  EXPECT_EQ(end[1], Value(0.0));
+  EXPECT_EQ(end[2], Value(0));
+  EXPECT_EQ(end[3], Value(0));
+  EXPECT_EQ(end[4], Value());
+}
+
+// What an application shows of itself does not depend on what may leave the device.
+TEST_F(TelvanedSessionMessagesTest, anEventThatEveryBackendDropsIsAggregatedAllTheSame) {
+  givenSection(StorebagBuilder::section("splunk", clientWith(kClientEntryEventWhitelist, Array{5})));
+  const auto client = startSession(sessionInfo(), userInfo(), true);
+  const size_t before = client->aggregated().size();
+  EXPECT_EQ(client->send(7)[0], Value());
+  EXPECT_TRUE(hasLine(log(), "Dropping event with category 7 as it is not whitelisted"));
+  ASSERT_EQ(client->aggregated().size(), before + 1);
+  EXPECT_EQ(client->aggregated().back()[2], Value(7));
 }
 
 TEST_F(TelvanedSessionMessagesTest, aSessionWithoutAnAggregatorAggregatesNothing) {
@@ -285,7 +311,17 @@ TEST_F(TelvanedSessionMessagesTest, aChangeOfUserInfoForgetsTheDigestsAlgorithmA
   EXPECT_TRUE(hasDigest());
 }
 
-TEST_F(TelvanedSessionMessagesTest, anAggregatorIsToldWhenTheSessionEnds) {
+TEST_F(TelvanedSessionMessagesTest, whatAnAggregatorThatHasGoneCannotHearIsOnlyLogged) {
+  givenStorebag();
+  const auto client = startSession(sessionInfo(), userInfo(), true);
+  const std::shared_ptr<TelvanedSession> session = sessions().front();
+  client->close();
+  session->sendToAggregator(Value(sessionInfo()), 1.0, 7, 1, Value());
+  world.runUntilIdle();
+  EXPECT_TRUE(hasLines(log(), 1, "sendMessageWithDictionary: Failed to get remote object proxy: "));
+}
+
+TEST_F(TelvanedSessionMessagesTest, aSessionThatEndsShutsItsAggregationDown) {
   givenStorebag();
   const auto root = startSession(sessionInfoIn("a", 0, 1), userInfo(), true);
   auto child = startSession(sessionInfoIn("a", 1, 2), userInfo(), true);
