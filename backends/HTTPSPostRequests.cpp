@@ -2,8 +2,8 @@
 #include <algorithm>
 
 #include "backends/HTTPSPostBackend.h"
-#include "backends/ListMatching.h"
 #include "backends/MessageFlags.h"
+#include "backends/SecuredURL.h"
 #include "interfaces/ClientTypes.h"
 #include "interfaces/SessionKeys.h"
 #include "interfaces/TelvaneErrors.h"
@@ -18,17 +18,6 @@ constexpr size_t kLongestSessionID = 40;  // characters
 constexpr int kFirstServerError = 500;
 constexpr int kLastServerError = 599;
 constexpr int32_t kHMACSHA1 = 0;
-constexpr std::string_view kSecureScheme = "https";
-constexpr std::string_view kSchemeEnd = "://";
-
-// Only an internal build may send without encryption. What stands between the first and the second "://" is kept.
-std::string securedURL(std::string_view url, bool isInternalBuild) {
-  const size_t schemeSize = url.find(kSchemeEnd);
-  if (isInternalBuild || equalsIgnoringCase(url.substr(0, schemeSize), kSecureScheme)) return std::string(url);
-  const std::string_view rest =
-      schemeSize != std::string_view::npos ? url.substr(schemeSize + kSchemeEnd.size()) : std::string_view();
-  return fmt::format("{}{}{}", kSecureScheme, kSchemeEnd, rest.substr(0, rest.find(kSchemeEnd)));
-}
 
 // Names come from clients; a line break in one must not make it two headers.
 std::string headerText(std::string_view text) {

@@ -1,7 +1,9 @@
 #include "storebag/StorebagExplanation.h"
 
 #include <algorithm>
+#include <unordered_set>
 
+#include "backends/SecuredURL.h"
 #include "interfaces/SessionKeys.h"
 #include "interfaces/StorebagKeys.h"
 #include "storebag/BackendCreation.h"
@@ -24,23 +26,37 @@ class GateRecorder final : public GateObserver {
   std::optional<size_t> _entry;
 };
 
-void addOnce(std::vector<String>& names, const Value& name) {
-  const String& text = *name.string();
-  if (std::find(names.begin(), names.end(), text) == names.end()) names.push_back(text);
-}
+// Sorts the names of macros in a section into those that are defined and those that are not, each once, in their order.
+// A bag may hold as many names as fit into its size.
+class MacroNames {
+ public:
+  explicit MacroNames(StorebagExplanation& explanation) : _explanation(explanation) {}
 
-// Recursion is bounded by the depth that the parsers admit.
-void sortMacroNames(const Value& value, StorebagExplanation& explanation) {
-  if (isMacroName(value)) {
-    const bool isDefined = macroNamedBy(value, explanation.macros) != nullptr;
-    addOnce(isDefined ? explanation.usedMacros : explanation.undefinedMacros, value);
+  // Recursion is bounded by the depth that the parsers admit. REQUIRES: the value outlives this object.
+  void sort(const Value& value) {
+    if (isMacroName(value) && _seen.insert(value.text()).second) {
+      const bool isDefined = macroNamedBy(value, _explanation.macros) != nullptr;
+      (isDefined ? _explanation.usedMacros : _explanation.undefinedMacros).push_back(*value.string());
+    }
+    if (const Dictionary* dictionary = value.dictionary()) {
+      for (const DictionaryEntry& entry : *dictionary) sort(entry.value);
+    }
+    if (const Array* array = value.array()) {
+      for (const Value& element : *array) sort(element);
+    }
   }
-  if (const Dictionary* dictionary = value.dictionary()) {
-    for (const DictionaryEntry& entry : *dictionary) sortMacroNames(entry.value, explanation);
-  }
-  if (const Array* array = value.array()) {
-    for (const Value& element : *array) sortMacroNames(element, explanation);
-  }
+
+ private:
+  StorebagExplanation& _explanation;
+  std::unordered_set<std::string_view> _seen;
+};
+
+// The address that the last setting of the URL leads to.
+std::optional<std::string> addressAfter(const std::vector<GateStep>& steps, Gate gate, bool isInternalBuild) {
+  const auto last =
+      std::find_if(steps.rbegin(), steps.rend(), [gate](const GateStep& step) { return step.answer.gate == gate; });
+  if (last == steps.rend() || !last->answer.tested.isString()) return std::nullopt;
+  return securedURL(last->answer.tested.text(), isInternalBuild);
 }
 
 BackendExplanation explainBackend(const ProcessContext& context, KeptLog& log, const DictionaryEntry& entry,
@@ -57,6 +73,9 @@ BackendExplanation explainBackend(const ProcessContext& context, KeptLog& log, c
     backend.setGateObserver(nullptr);
     explanation.isMade = true;
     explanation.batchesEvents = backend.batchEvents();
+    const bool isInternalBuild = context.isInternalBuild();
+    explanation.postAddress = addressAfter(explanation.steps, Gate::PostURL, isInternalBuild);
+    explanation.realtimePostAddress = addressAfter(explanation.steps, Gate::RealtimePostURL, isInternalBuild);
   }
   explanation.logLines = log.take();
   return explanation;
@@ -82,7 +101,7 @@ StorebagExplanation explainStorebag(Platform& platform, KeptLog& log, const Dict
   explanation.section = section.name;
   explanation.logLines = log.take();
   if (!section.content.has_value()) return explanation;
-  sortMacroNames(bag[section.name], explanation);
+  MacroNames(explanation).sort(bag[section.name]);
   for (const DictionaryEntry& entry : *section.content) {
     // The session reads it, no backend.
     if (entry.key == kStorebagReleaseTimeout.view()) continue;

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <optional>
+#include <string>
 #include <string_view>
 #include <vector>
 
@@ -24,6 +25,9 @@ struct BackendExplanation {
   bool isMade = false;  // whether the factory makes a backend of the name and its profile; what follows is of one
   uint32_t state = 0;   // a TelvaneBackendState
   bool batchesEvents = false;
+  // Where posts of ordinary and of real-time events really go; absent when the decision came to no URL.
+  std::optional<std::string> postAddress;
+  std::optional<std::string> realtimePostAddress;
   std::vector<GateStep> steps;
   std::vector<KeptLog::Line> logLines;  // what the daemon would write
 };
@@ -35,7 +39,7 @@ struct StorebagExplanation {
   std::vector<std::string_view> sections;    // the environments that the bag has sections for
   std::string_view environment;              // the one that the device asks for
   std::string_view section;                  // the one that it gets; empty when there is none
-  Value releaseTimeout;                      // absent when the bag has none
+  Value releaseTimeout;                      // as the bag has it; absent when it has none
   Dictionary macros;                         // what is put in the place of each name
   std::vector<String> usedMacros;            // names in the section, in their order, each once
   std::vector<String> undefinedMacros;       // texts of the section that read as names and are none

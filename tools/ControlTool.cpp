@@ -28,8 +28,9 @@ int ControlTool::run(int argc, const char* const* argv) {
     return kWrongUsage;
   }
   const Result<void> done = perform(*app.get_subcommands().front());
-  if (!done.has_error()) return 0;
-  _printer.error(done.error().description());
+  if (!done.has_error() && _printer.hasPrinted()) return 0;
+  _printer.error(done.has_error() ? done.error().description()
+                                  : "cannot write to standard output; see whether its disk is full");
   return kFailure;
 }
 

@@ -6,6 +6,7 @@
 
 #include "foundation/Description.h"
 #include "platform/JSON.h"
+#include "tools/VisibleText.h"
 
 namespace telvane::linttext {
 namespace {
@@ -16,24 +17,6 @@ constexpr size_t kLongestList = 8;
 bool isPlain(char c) noexcept {
   return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '.' || c == '-' ||
          c == '_' || c == '=';
-}
-
-// JSON leaves the delete character and the second set of control characters (U+0080 to U+009F) as they are.
-std::string withoutControls(std::string_view text) {
-  std::string result;
-  for (size_t i = 0; i < text.size(); ++i) {
-    const auto byte = static_cast<unsigned char>(text[i]);
-    const auto next = i + 1 < text.size() ? static_cast<unsigned char>(text[i + 1]) : 0;
-    if (byte == 0x7F) {
-      result += "\\u007f";
-    } else if (byte == 0xC2 && next >= 0x80 && next < 0xA0) {
-      result += fmt::format("\\u{:04x}", next);
-      ++i;
-    } else {
-      result += text[i];
-    }
-  }
-  return result;
 }
 
 // Cut between two characters.
@@ -57,7 +40,7 @@ std::string pathTo(std::string_view parent, size_t index) { return fmt::format("
 std::string quoted(std::string_view text) {
   const std::string_view shown = firstBytes(text);
   const Result<std::string> json = json::serialize(Value(shown));
-  std::string result = json.has_value() ? withoutControls(*json) : std::string("\"\"");
+  std::string result = json.has_value() ? visibleText(*json) : std::string("\"\"");
   if (shown.size() < text.size()) result += "...";
   return result;
 }

@@ -18,6 +18,11 @@ class Printer {
     MutexLock lock(_mutex);
     _output << text << "\n" << std::flush;
   }
+  // Whether all lines so far went out.
+  bool hasPrinted() {
+    MutexLock lock(_mutex);
+    return static_cast<bool>(_output.flush());
+  }
   void error(std::string_view text) {
     MutexLock lock(_mutex);
     _errors << _program << ": " << text << "\n" << std::flush;

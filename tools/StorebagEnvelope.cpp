@@ -12,6 +12,8 @@ namespace {
 
 constexpr char kDomain[] = "TelvaneStorebag";
 
+constexpr std::string_view kByteOrderMark = "\xEF\xBB\xBF";
+
 Error fault(const std::string& text) { return Error::withDescription(kDomain, 1, text); }
 
 bool looksLikeJSON(std::string_view text) {
@@ -38,8 +40,12 @@ Result<Dictionary> dictionaryOf(const Result<Value>& parsed, const std::string& 
 
 }  // namespace
 
-Result<Dictionary> parseBag(const Data& text) {
-  return dictionaryOf(looksLikeJSON(text.view()) ? json::parse(text.view()) : propertylist::parse(text), "the bag");
+Result<Dictionary> parseBag(const Data& bytes) {
+  std::string_view text = bytes.view();
+  if (text.empty()) return fault("the file is empty");
+  // Some editors put one before JSON.
+  if (text.starts_with(kByteOrderMark)) text.remove_prefix(kByteOrderMark.size());
+  return dictionaryOf(looksLikeJSON(text) ? json::parse(text) : propertylist::parse(bytes), "the bag");
 }
 
 Result<Data> seal(const Dictionary& bag, const crypto::PrivateKey& key) {

@@ -7,9 +7,13 @@
 #include "interfaces/BackendKind.h"
 #include "interfaces/StorebagKeys.h"
 #include "platform/JSON.h"
+#include "tools/URLText.h"
+#include "tools/VisibleText.h"
 
 namespace telvane {
 namespace {
+
+constexpr double kPercent = 100;
 
 struct GateWords {
   Gate gate;
@@ -76,8 +80,36 @@ std::string wholeText(const Value& value) {
   return description(value);
 }
 
-// A bag's text must not steer a terminal, nor look like another line.
-bool isControl(char c) noexcept { return static_cast<unsigned char>(c) < ' ' || c == '\x7f'; }
+// What is wrong with an address, as the end of a sentence; empty when posts can reach one. Without a scheme, http is
+// taken, which only internal builds come to.
+std::string addressFault(const std::string& address) {
+  const bool hasScheme = address.find("://") != std::string::npos;
+  const std::string whole = (hasScheme ? "" : "http://") + address;
+  const URLText::Parsed parsed = URLText::parse(whole);
+  if (!parsed.url.has_value()) return parsed.fault;
+  if (parsed.url->isPlaceholder) return "has a mark in place of the host";
+  return parsed.url->hasScheme("https") || parsed.url->hasScheme("http") ? "" : "is neither https nor http";
+}
+
+std::string enabledSentence(const BackendExplanation& backend) {
+  if (!backend.postAddress.has_value()) return "lost: there is no address to post to";
+  const std::string& address = *backend.postAddress;
+  if (const std::string fault = addressFault(address); !fault.empty()) {
+    return fmt::format("lost: they would be posted to {}, which {}", shortText(address), fault);
+  }
+  std::string text = backend.batchesEvents ? "batched, and sent with a flush" : "sent at once, one by one";
+  if (settingAfter(backend, Gate::PostURL).text() != address) text += fmt::format(", to {}", shortText(address));
+  const std::string realtime = backend.realtimePostAddress.value_or(address);
+  if (const std::string fault = addressFault(realtime); !fault.empty()) {
+    return text +
+           fmt::format("; real-time ones are lost: they would be posted to {}, which {}", shortText(realtime), fault);
+  }
+  if (backend.batchesEvents) text += "; real-time ones at once";
+  if (realtime != address && settingAfter(backend, Gate::RealtimePostURL).text() != realtime) {
+    text += fmt::format("{} to {}", backend.batchesEvents ? "," : "; real-time ones", shortText(realtime));
+  }
+  return text;
+}
 
 std::string expediteSentence(const GateStep& step) {
   const std::string_view words = batchingWords(step.answer.tested.booleanValue());
@@ -140,10 +172,17 @@ std::string countryThresholdSentence(const GateStep& step) {
   return step.answer.against.isPresent() ? "no item lists the country" : "none";
 }
 
+// A share beyond its ends is none, or all of them.
+double shareOfDevices(const Value& threshold) {
+  const double share = threshold.realValue();
+  return share > 0 ? std::min(share, 1.0) : 0;
+}
+
 std::string samplingSentence(const GateStep& step) {
   const auto& [gate, outcome, tested, against] = step.answer;
   if (!against.isPresent()) return "without a threshold nobody reports";
-  return fmt::format("factor {} is {}below {}", tested.realValue(), isPassed(step) ? "" : "not ", shortText(against));
+  return fmt::format("factor {} is {}below {} ({:g} % of devices)", tested.realValue(), isPassed(step) ? "" : "not ",
+                     shortText(against), shareOfDevices(against) * kPercent);
 }
 
 std::string overrideSamplingSentence(const GateStep& step) {
@@ -157,6 +196,9 @@ std::string overrideSamplingSentence(const GateStep& step) {
 }
 
 std::string eventThresholdSentence(const GateStep& step) {
+  if (step.answer.tested.integerValue() < 0) {
+    return fmt::format("{}, so every event posts what waits", step.answer.tested.integerValue());
+  }
   return fmt::format("{}, so at most {} events of a category wait", step.answer.tested.integerValue(),
                      step.answer.tested.integerValue() + 1);
 }
@@ -305,8 +347,7 @@ std::string eventsSentence(const BackendExplanation& backend, const StorebagExpl
   if (situation.clientName.empty() && situation.serviceName.empty()) {
     return "lost: a session without client name and service name has no connection to post through";
   }
-  if (!settingAfter(backend, Gate::PostURL).isPresent()) return "lost: there is no address to post to";
-  return backend.batchesEvents ? "batched, and sent with a flush; real-time ones at once" : "sent at once, one by one";
+  return enabledSentence(backend);
 }
 
 std::string notMadeSentence(const BackendExplanation& backend, const StorebagExplainCase& situation) {
@@ -325,8 +366,7 @@ const Value& settingAfter(const BackendExplanation& backend, Gate gate) noexcept
 
 std::string shortText(const Value& value) {
   constexpr size_t kLongest = 1000;
-  std::string text = wholeText(value);
-  std::replace_if(text.begin(), text.end(), isControl, ' ');
+  const std::string text = visibleText(wholeText(value));
   if (text.size() <= kLongest) return text;
   size_t end = kLongest;
   while ((static_cast<unsigned char>(text[end]) & 0xC0) == 0x80) --end;  // not in the middle of a character

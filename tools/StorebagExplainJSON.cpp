@@ -49,6 +49,8 @@ constexpr Key kStateNumber{"stateNumber"};
 constexpr Key kEvents{"events"};
 constexpr Key kPostURL{"postURL"};
 constexpr Key kRealtimePostURL{"realtimePostURL"};
+constexpr Key kPostAddress{"postAddress"};
+constexpr Key kRealtimePostAddress{"realtimePostAddress"};
 constexpr Key kFilters{"filters"};
 constexpr Key kGates{"gates"};
 constexpr Key kBecause{"because"};
@@ -67,6 +69,13 @@ Array arrayOf(const Names& names) {
   Array array;
   for (const auto& name : names) array.append(Value(name));
   return array;
+}
+
+// As the session reads it.
+Value secondsOrNone(const Value& value) { return value.isPresent() ? Value(value.uint32Value()) : Value(); }
+
+Value addressOrNone(const std::optional<std::string>& address) {
+  return address.has_value() ? Value(*address) : Value();
 }
 
 Value textOrNone(const std::string& text) { return text.empty() ? Value() : Value(text); }
@@ -112,6 +121,8 @@ void addDecision(Dictionary& fields, const BackendExplanation& backend, const St
   fields.set(kBatchesEvents, backend.batchesEvents);
   fields.set(kPostURL, writable(settingAfter(backend, Gate::PostURL)));
   fields.set(kRealtimePostURL, writable(settingAfter(backend, Gate::RealtimePostURL)));
+  fields.set(kPostAddress, addressOrNone(backend.postAddress));
+  fields.set(kRealtimePostAddress, addressOrNone(backend.realtimePostAddress));
   fields.set(kFilters, writable(settingAfter(backend, Gate::Filters)));
   Array gates;
   for (const GateStep& step : backend.steps) gates.append(stepDictionary(step));
@@ -146,7 +157,7 @@ Dictionary explanationDictionary(const StorebagExplainReport& report) {
           {kEnvironment, explanation.environment},
           {kSection, explanation.section.empty() ? Value() : Value(explanation.section)},
           {kSections, arrayOf(explanation.sections)},
-          {kReleaseTimeout, writable(explanation.releaseTimeout)},
+          {kReleaseTimeout, secondsOrNone(explanation.releaseTimeout)},
           {kMacros, macros},
           {kUsedMacros, arrayOf(explanation.usedMacros)},
           {kUndefinedMacros, arrayOf(explanation.undefinedMacros)},

@@ -1,6 +1,7 @@
 #include "tools/StorebagExplainText.h"
 
 #include <algorithm>
+#include <set>
 
 #include "foundation/Format.h"
 #include "interfaces/ClientTypes.h"
@@ -54,17 +55,35 @@ std::string sectionText(const StorebagExplanation& explanation) {
                      explanation.section);
 }
 
+std::string moreText(size_t count) { return fact("", fmt::format("and {} more", count)); }
+
+// The first macros of the bag; all of them are in the JSON.
 std::string macrosText(const StorebagExplanation& explanation) {
+  constexpr size_t kMostShown = 100;
+  const std::set<std::string_view> used(explanation.usedMacros.begin(), explanation.usedMacros.end());
   std::string text;
+  size_t shown = 0;
   for (const DictionaryEntry& macro : explanation.macros) {
-    const auto& used = explanation.usedMacros;
-    const bool isUsed = std::find(used.begin(), used.end(), macro.key) != used.end();
+    if (shown++ == kMostShown) break;
     text += fact(text.empty() ? "macros" : "", fmt::format("{} = {}{}", shortText(macro.key), shortText(macro.value),
-                                                           isUsed ? "" : " (not used here)"));
+                                                           used.contains(macro.key.view()) ? "" : " (not used here)"));
   }
-  for (const String& name : explanation.undefinedMacros) {
-    text += fact(text.empty() ? "macros" : "", fmt::format("{} is not defined and stays as it is", shortText(name)));
+  if (explanation.macros.size() > kMostShown) text += moreText(explanation.macros.size() - kMostShown);
+  const auto& undefined = explanation.undefinedMacros;
+  for (size_t i = 0; i < std::min(undefined.size(), kMostShown); ++i) {
+    text += fact(text.empty() ? "macros" : "",
+                 fmt::format("{} is not defined and stays as it is", shortText(undefined[i])));
   }
+  if (undefined.size() > kMostShown) text += moreText(undefined.size() - kMostShown);
+  return text;
+}
+
+// The session reads any value as a number.
+std::string connectionText(const Value& releaseTimeout) {
+  const uint32_t seconds = releaseTimeout.uint32Value();
+  std::string text = fmt::format("kept {} s when nobody reports", seconds);
+  if (seconds == 0) text = "kept until the daemon ends";
+  if (!releaseTimeout.isNumber()) text += fmt::format(" (the bag says {})", shortText(releaseTimeout));
   return text;
 }
 
@@ -85,11 +104,7 @@ bool isWorthALine(const GateStep& step) {
 std::string logText(const std::vector<KeptLog::Line>& lines) {
   std::string text;
   for (const KeptLog::Line& line : lines) {
-    std::string message = line.message;
-    for (size_t at = message.find('\n'); at != std::string::npos; at = message.find('\n', at)) {
-      message.replace(at, 1, "\\n");
-    }
-    text += fmt::format("  log      {}{}\n", line.level == LogLevel::Error ? "<error> " : "", shortText(message));
+    text += fmt::format("  log      {}{}\n", line.level == LogLevel::Error ? "<error> " : "", shortText(line.message));
   }
   return text;
 }
@@ -109,6 +124,46 @@ std::string backendText(const BackendExplanation& backend, const StorebagExplain
   return log == ExplainedLog::Shown ? text + logText(backend.logLines) : text;
 }
 
+// Whether a backend's state hangs on a draw that nobody gave.
+bool hangsOnAssumedDraw(const StorebagExplainReport& report) {
+  const bool isAssumed = std::any_of(report.assumed.begin(), report.assumed.end(), [](const std::string& option) {
+    return option.starts_with("--sampling-factor ");
+  });
+  const auto leavesSomeOut = [](const GateStep& step) {
+    const Value& threshold = step.answer.against;
+    return step.answer.gate == Gate::Sampling && threshold.isPresent() && threshold.realValue() < 1;
+  };
+  const auto& backends = report.explanation.backends;
+  return isAssumed && std::any_of(backends.begin(), backends.end(), [&](const BackendExplanation& backend) {
+           return std::any_of(backend.steps.begin(), backend.steps.end(), leavesSomeOut);
+         });
+}
+
+// The client type whose bag has this file's name, when the session's type has another bag; null otherwise.
+const ClientType* otherTypeOfFile(const StorebagExplainReport& report) {
+  std::string_view stem = report.file;
+  if (const size_t slash = stem.rfind('/'); slash != std::string_view::npos) stem.remove_prefix(slash + 1);
+  stem = stem.substr(0, stem.find('.'));
+  if (stem == clientType(report.situation.clientType)->storebagName) return nullptr;
+  const auto& types = allClientTypes();
+  const auto found =
+      std::find_if(types.begin(), types.end(), [stem](const ClientType& type) { return type.storebagName == stem; });
+  return found != types.end() ? &*found : nullptr;
+}
+
+// What a reader may overlook.
+std::string notesText(const StorebagExplainReport& report) {
+  std::string text;
+  if (hangsOnAssumedDraw(report)) {
+    text += fact("note", "the sampling factor is assumed; other devices draw another, see --sampling-factor");
+  }
+  if (const ClientType* other = otherTypeOfFile(report)) {
+    text +=
+        fact("note", fmt::format("the file is named as the bag of client type {}; see --client-type", other->number));
+  }
+  return text;
+}
+
 }  // namespace
 
 std::string explanationText(const StorebagExplainReport& report, ExplainedLog log) {
@@ -118,10 +173,11 @@ std::string explanationText(const StorebagExplainReport& report, ExplainedLog lo
                      fact("consent", report.situation.hasConsent ? "on" : "off") +
                      fact("assumed", joined(report.assumed)) + macrosText(explanation);
   if (explanation.releaseTimeout.isPresent()) {
-    text += fact("connection", fmt::format("kept {} s when nobody reports", shortText(explanation.releaseTimeout)));
+    text += fact("connection", connectionText(explanation.releaseTimeout));
   }
   if (log == ExplainedLog::Shown) text += logText(explanation.logLines);
   if (explanation.backends.empty() && !explanation.section.empty()) text += "\nthe section names no backend\n";
+  text += notesText(report);
   for (const BackendExplanation& backend : explanation.backends) text += backendText(backend, report, log);
   return text;
 }

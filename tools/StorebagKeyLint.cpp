@@ -23,6 +23,8 @@ constexpr std::string_view kMacroPrefix = "==";
 constexpr std::string_view kMaxAge = "max-age";
 constexpr std::string_view kReadAsAbsent = "devices go on as if it were not there";
 constexpr std::string_view kReadAsZero = "devices read it as 0";
+constexpr double kSamplingSteps = 10000;
+constexpr double kRounding = 1e-6;  // what a decimal fraction may lack of its step
 constexpr int64_t kMostRefreshSeconds = 86400;
 constexpr int64_t kLastCategory = std::numeric_limits<uint16_t>::max();
 constexpr size_t kVersionParts = 3;
@@ -237,6 +239,12 @@ void StorebagKeyLint::lintURL(const std::string& path, const Row& row, const Val
   }
   if (url.hasScheme("https")) return;
   if (!url.hasScheme("http")) {
+    const bool isRewritten = row.shape == Shape::PostURL && _audience != Audience::InternalBuilds;
+    if (isRewritten) {
+      _report.error(
+          path, fmt::format("has the scheme {}, in whose place devices take https; write https", quoted(url.scheme)));
+      return;
+    }
     _report.error(path, fmt::format("has the scheme {}, which nobody speaks here; write https", quoted(url.scheme)));
     return;
   }
@@ -315,9 +323,10 @@ void StorebagKeyLint::lintWholeNumber(const std::string& path, const Row& row, c
   const bool isInRange =
       *number > static_cast<double>(range.least) - 1 && *number < static_cast<double>(range.most) + 1;
   if (isInRange) return lintRange(path, row, static_cast<int64_t>(*number));
-  const std::string_view consequence = row.shape == Shape::EventNumber ? "fits no event"
-                                       : row.shape == Shape::Consent   ? "means nothing and counts as 0"
-                                                                       : "is out of range";
+  const std::string consequence = row.shape == Shape::EventNumber ? "fits no event"
+                                  : row.shape == Shape::Consent
+                                      ? "means nothing and counts as 0"
+                                      : fmt::format("is out of range ({} to {})", range.least, range.most);
   _report.error(
       path, fmt::format("is {}, which {}; make it: {}", shortForm(value), consequence, storebagShapeName(row.shape)));
 }
@@ -348,6 +357,9 @@ void StorebagKeyLint::lintShare(const std::string& path, const Row& row, const V
   } else if (*number > 1) {
     _report.error(path, fmt::format("is {}, and 1 is all devices already; make it: {} (10 percent is 0.1)",
                                     shortForm(value), storebagShapeName(row.shape)));
+  } else if (const double steps = *number * kSamplingSteps; std::abs(steps - std::round(steps)) > kRounding) {
+    _report.warning(path, fmt::format("is {}, finer than devices draw: a share goes in steps of 0.0001; write {:g}",
+                                      shortForm(value), std::ceil(steps) / kSamplingSteps));
   }
 }
 
@@ -448,7 +460,8 @@ void StorebagKeyLint::lintEntries(const std::string& path, const Row& row, const
 void StorebagKeyLint::lintDictionary(const std::string& path, const Row& row, const Value& value) {
   const Dictionary* dictionary = value.dictionary();
   if (dictionary == nullptr) {
-    reportKind(path, storebagShapeName(row.shape), value, row.absent);
+    reportKind(path, storebagShapeName(row.shape), value,
+               row.shape == Shape::Macros ? std::string_view("there are no macros") : row.absent);
   } else if (dictionary->empty() && row.shape == Shape::Section) {
     _report.warning(path, "names no backend: devices of this environment report nothing; name one");
   }

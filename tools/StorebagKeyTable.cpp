@@ -40,7 +40,7 @@ constexpr StorebagKey kBagKeys[] = {
     {kEnvironmentInternal, Shape::Section, Optional, "devices of this environment get no bag",
      "The section of devices in the environment 2, the house's own; internal builds unless they are set otherwise.",
      "From a backend's name to its profile."},
-    {kEnvironmentSeed, Shape::Section, Optional, "`release`, with an error line",
+    {kEnvironmentSeed, Shape::Section, Optional, "devices of this environment get `release`, with an error line",
      "The section of devices in the environment 3, for a release before the release.",
      "From a backend's name to its profile."},
     {kEnvironmentRelease, Shape::Section, Required, "customers' devices get no bag",

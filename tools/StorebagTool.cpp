@@ -65,7 +65,10 @@ int StorebagTool::run(int argc, const char* const* argv) {
     _errors << kName << ": " << error.what() << "; see telvane-storebag --help\n";
     return kWrongUsage;
   }
-  const Result<void> done = dispatch(app.get_subcommands().front()->get_name());
+  Result<void> done = dispatch(app.get_subcommands().front()->get_name());
+  // What was not printed was not told: a full disk behind the output must not look like a bag without mistakes.
+  if (!done.has_error() && !_output.flush())
+    done = fault("cannot write to standard output; see whether its disk is full");
   if (!done.has_error()) return _status;
   _errors << kName << ": " << done.error().description() << "\n";
   return kFailure;
@@ -108,7 +111,18 @@ Result<void> StorebagTool::sign() {
   }
   const Result<Data> envelope = storebagenvelope::seal(*bag, *key);
   if (envelope.has_error()) return envelope.error();
-  return _files.writeAtomically(_outputFile, *envelope);
+  const Result<void> written = _files.writeAtomically(_outputFile, *envelope);
+  if (written.has_value()) tellMistakes(*text);
+  return written;
+}
+
+// A signed bag with mistakes may be meant, in a test; whom it surprises should hear of them before devices do.
+void StorebagTool::tellMistakes(const Data& bag) {
+  const Result<LintReport> report = StorebagLint::lintFile(bag);
+  const size_t errors = report.has_value() ? report->count(LintFinding::Severity::Error) : 0;
+  if (errors == 0) return;
+  _errors << kName << ": signed, but lint finds " << counted(errors, "error") << " in " << _inputFile
+          << "; see telvane-storebag lint\n";
 }
 
 Result<void> StorebagTool::verify() {

@@ -23,6 +23,7 @@ class StorebagTool {
  private:
   Result<void> keygen();
   Result<void> sign();
+  void tellMistakes(const Data& bag);
   Result<void> verify();
   Result<void> show();
   Result<void> lint();

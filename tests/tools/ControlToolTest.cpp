@@ -2,6 +2,7 @@
 
 #include <gmock/gmock.h>
 
+#include <fstream>
 #include <sstream>
 
 #include "interfaces/AgentKeys.h"
@@ -28,6 +29,13 @@ class ControlToolTest : public ClientFixture {
   std::ostringstream _output;
   std::ostringstream _errors;
 };
+
+TEST_F(ControlToolTest, outputThatCannotBeWrittenIsAFailure) {
+  std::ofstream full("/dev/full");
+  const char* const arguments[] = {"telvanectl", "consent", "show"};
+  EXPECT_EQ(ControlTool(_context, full, _errors).run(3, arguments), 1);
+  EXPECT_EQ(_errors.str(), "telvanectl: cannot write to standard output; see whether its disk is full\n");
+}
 
 TEST_F(ControlToolTest, wrongUsageIsTwoAndPointsToTheHelp) {
   const std::vector<std::vector<const char*>> wrong = {

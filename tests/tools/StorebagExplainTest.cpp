@@ -343,9 +343,114 @@ TEST_F(StorebagExplainTest, aBagsTextCannotSteerATerminalOrLookLikeAnotherLine) 
   section.set("splunk\nqrs", profile());
   givenBag({{kEnvironmentRelease, section}});
   ASSERT_EQ(run({"explain", "@bag", "--log"}), 0) << errors();
-  EXPECT_THAT(output(), HasSubstr("\nsplunk qrs: disabled\n"));
+  EXPECT_THAT(output(), HasSubstr("\nsplunk\\nqrs: disabled\n"));
   EXPECT_THAT(output(), Not(HasSubstr("\x1b")));
   EXPECT_THAT(output(), Not(HasSubstr("\nsplunk: enabled")));
+}
+
+TEST_F(StorebagExplainTest, showsCharactersThatATerminalActsOnInsteadOfSendingThem) {
+  _client.set(kClientEntryLocaleWhitelist, Array{"\u009b31mred\u202evil\ufeff\x7f"});
+  explainBackend();
+  ASSERT_EQ(run({"explain", "@bag"}), 0) << errors();
+  EXPECT_THAT(output(), HasSubstr("\\u009b31mred\\u202evil\\ufeff\\u007f"));
+  EXPECT_THAT(output(), Not(HasSubstr("\u009b")));
+  EXPECT_THAT(output(), Not(HasSubstr("\u202e")));
+}
+
+// Looking each name up among all those before it once took a bag of the largest size an hour.
+TEST_F(StorebagExplainTest, aBagOfCountlessMacrosIsExplainedInTheTimeOfAFew) {
+  constexpr int kMacros = 100000;
+  Dictionary macros;
+  Array names;
+  for (int n = 0; n < kMacros; ++n) {
+    macros.set(fmt::format("==USED{}", n), "US");
+    names.append(fmt::format("==USED{}", n));
+    names.append(fmt::format("==UNKNOWN{}", n));
+  }
+  _client.set(kClientEntryLocaleWhitelist, names);
+  Dictionary withMacros = bag();
+  withMacros.set(kStorebagSharedValues, macros);
+  givenBag(withMacros);
+  ASSERT_EQ(run({"explain", "@bag"}), 0) << errors();
+  EXPECT_THAT(output(), HasSubstr("==USED99 = [US]\n"));
+  EXPECT_THAT(output(), HasSubstr("and 99900 more\n"));
+  EXPECT_LT(output().size(), 100000u);
+  EXPECT_THAT(output(), Not(HasSubstr("==UNKNOWN99999")));
+  ASSERT_EQ(run({"explain", "@bag", "--json"}), 0) << errors();
+  EXPECT_THAT(output(), HasSubstr("==UNKNOWN99999\""));
+}
+
+TEST_F(StorebagExplainTest, namesTheAddressThatPostsReallyGoTo) {
+  struct Case {
+    const char* url;
+    const char* events;
+  };
+  constexpr Case kCustomer[] = {
+      {"https://c.example/e", "sent at once, one by one"},
+      {"http://c.example/e", "sent at once, one by one, to https://c.example/e"},
+      {"ftp://x/", "sent at once, one by one, to https://x/"},
+      {"", "lost: they would be posted to https://, which has no host"},
+      {"c.example/e", "lost: they would be posted to https://, which has no host"},
+      {"https://", "lost: they would be posted to https://, which has no host"},
+  };
+  for (const Case& one : kCustomer) {
+    _client.set(kClientEntryPostURL, one.url);
+    EXPECT_EQ(text(explainBackend(0, {"--batch-events", "off"}), "events"), one.events) << one.url;
+  }
+  _client.set(kClientEntryPostURL, "http://c.example/e");
+  EXPECT_EQ(text(explainBackend(), "postAddress"), "https://c.example/e");
+  _client.set(kClientEntryRealtimePostURL, "c.example/realtime");
+  EXPECT_EQ(text(explainBackend(), "events"),
+            "batched, and sent with a flush, to https://c.example/e; real-time ones are lost: they would be posted to "
+            "https://, which has no host");
+  _client.set(kClientEntryRealtimePostURL, Value());
+  givenBag(bag());
+  ASSERT_EQ(run({"explain", "@bag", "--internal", "--environment", "release", "--client-name", "player",
+                 "--service-name", "StreamMediaPlayer", "--product-family", "TelvaneBox"}),
+            0);
+  EXPECT_THAT(output(), HasSubstr("events   sent at once, one by one\n")) << "an internal build takes http as it is";
+}
+
+TEST_F(StorebagExplainTest, saysTheShareOfDevicesAndThatTheDrawIsAssumed) {
+  _client.set(kClientEntrySamplingThreshold, 0.01);
+  _client.set(kClientEntryEventThreshold, -1);
+  givenBag(bag());
+  ASSERT_EQ(run({"explain", "@bag"}), 0);
+  EXPECT_THAT(output(), HasSubstr("factor 0 is below 0.01 (1 % of devices)\n"));
+  EXPECT_THAT(output(), HasSubstr("note         the sampling factor is assumed;"));
+  EXPECT_THAT(output(), HasSubstr("-1, so every event posts what waits\n"));
+  ASSERT_EQ(run({"explain", "@bag", "--sampling-factor", "0"}), 0);
+  EXPECT_THAT(output(), Not(HasSubstr("note ")));
+  _client.set(kClientEntrySamplingThreshold, 1.0);
+  givenBag(bag());
+  ASSERT_EQ(run({"explain", "@bag"}), 0);
+  EXPECT_THAT(output(), Not(HasSubstr("note ")));
+}
+
+TEST_F(StorebagExplainTest, hintsAtTheClientTypeThatTheFileIsNamedAfter) {
+  givenBag(bag());
+  const std::string content = _scratch.read("bag");
+  _scratch.write("conferencing.plist", content);
+  ASSERT_EQ(run({"explain", "@conferencing.plist", "--client-type", "6"}), 0);
+  EXPECT_THAT(output(), HasSubstr("note         the file is named as the bag of client type 7; see --client-type\n"));
+  ASSERT_EQ(run({"explain", "@conferencing.plist", "--client-type", "11"}), 0);
+  EXPECT_THAT(output(), Not(HasSubstr("the file is named")));
+}
+
+TEST_F(StorebagExplainTest, readsTheReleaseTimeoutAsTheSessionDoes) {
+  const auto connection = [this](Value timeout) {
+    Dictionary timed = bag();
+    timed.set(kStorebagReleaseTimeout, std::move(timeout));
+    givenBag(timed);
+    EXPECT_EQ(run({"explain", "@bag"}), 0);
+    const size_t at = output().find("connection");
+    return at == std::string::npos ? "" : output().substr(at, output().find('\n', at) - at);
+  };
+  EXPECT_EQ(connection(60), "connection   kept 60 s when nobody reports");
+  EXPECT_EQ(connection(60.9), "connection   kept 60 s when nobody reports");
+  EXPECT_EQ(connection("60 seconds"), "connection   kept 60 s when nobody reports (the bag says 60 seconds)");
+  EXPECT_EQ(connection("abc"), "connection   kept until the daemon ends (the bag says abc)");
+  EXPECT_EQ(connection(Value()), "");
 }
 
 TEST_F(StorebagExplainTest, cutsLongListsInTheTextAndKeepsThemInJSON) {

@@ -118,6 +118,7 @@ TEST(StorebagLintTest, namesAValueThatDevicesMisread) {
       {"filters", Dictionary(), "error", "filters", "is a dictionary, and the backend is disabled"},
       {"filters", Array{"x"}, "error", "filters[0]", "is text, and it disables the backend"},
       {"sampling_threshold", 1.5, "error", "sampling_threshold", "is 1.5, and 1 is all devices already"},
+      {"sampling_threshold", 0.00005, "warning", "sampling_threshold", "in steps of 0.0001; write 0.0001"},
       {"sampling_threshold", -0.1, "error", "sampling_threshold", "no share is below 0"},
       {"sampling_threshold", kNaN, "error", "sampling_threshold", "no finite number"},
       {"sampling_threshold", kInfinity, "error", "sampling_threshold", "no finite number"},
@@ -128,11 +129,12 @@ TEST(StorebagLintTest, namesAValueThatDevicesMisread) {
       {"override_sampling", 2, "error", "override_sampling", "is 2, and 1 is all devices already"},
       {"custom_clientId", false, "error", "custom_clientId", "is false and yet counts"},
       {"event_threshold", -1, "warning", "event_threshold", "every event posts what waits"},
-      {"event_threshold", 1e12, "error", "event_threshold", "out of range"},
+      {"event_threshold", 1e12, "error", "event_threshold", "out of range (-2147483648 to 2147483647)"},
       {"event_threshold", 1.5, "warning", "event_threshold", "cut the fraction off"},
       {"extras_on_internal", Dictionary(), "error", "extras_on_internal", "is a dictionary, and devices read it as 0"},
       {"post_url", "http://collector.example/", "error", "post_url", "is plain http, and devices post to https"},
       {"post_url", "collector.example", "error", "post_url", "is no URL: it does not begin with https://"},
+      {"post_url", "ftp://collector.example/", "error", "post_url", "\"ftp\", in whose place devices take https"},
       {"post_url", "https://", "error", "post_url", "is no URL: it has no host"},
       {"post_url", "https://a b/", "error", "post_url", "holds blanks"},
       {"post_url", "https://a.example:99999/", "error", "post_url", "has a port that is none"},
@@ -169,7 +171,10 @@ TEST(StorebagLintTest, namesAValueOfTheBagThatDevicesMisread) {
   EXPECT_THAT(lintBag(bagWith("refresh_cycle", "hourly")), ElementsAre(error("refresh_cycle", "no number")));
   EXPECT_THAT(lintBag(bagWith("release_timeout", -1)), ElementsAre(error("release_timeout", "out of range")));
   EXPECT_THAT(lintBag(bagWith("release_timeout", Value(1e10))), ElementsAre(error("release_timeout", "out of range")));
-  EXPECT_THAT(lintBag(bagWith("shared_values", "x")), ElementsAre(error("shared_values", "is text, and no macros")));
+  EXPECT_THAT(lintBag(bagWith("seed", Array())),
+              ElementsAre(error("seed", "is an array, and devices of this environment get `release`")));
+  EXPECT_THAT(lintBag(bagWith("shared_values", "x")),
+              ElementsAre(error("shared_values", "is text, and there are no macros")));
 }
 
 TEST(StorebagLintTest, namesFiltersThatDoNotFilter) {

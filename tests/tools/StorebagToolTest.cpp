@@ -4,6 +4,7 @@
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 
+#include <fstream>
 #include <sstream>
 
 #include "platform/system/PosixFileSystem.h"
@@ -105,6 +106,35 @@ TEST_F(StorebagToolTest, signsNoBagThatNoDeviceWouldTake) {
   EXPECT_EQ(sign("{\"refresh_cycle\": 60}"), 1);
   expectOneErrorLine("version");
   EXPECT_EQ(_scratch.read("envelope"), "");
+}
+
+TEST_F(StorebagToolTest, saysHowManyMistakesTheSignedBagHas) {
+  keygen("mine");
+  ASSERT_EQ(sign("{\"version\": \"1\", \"nonsense\": 1}"), 0);
+  EXPECT_THAT(_errors.str(), ::testing::HasSubstr("signed, but lint finds 2 errors in "));
+  EXPECT_NE(_scratch.read("envelope"), "");
+}
+
+TEST_F(StorebagToolTest, readsJSONWithAByteOrderMarkAndSaysOfAnEmptyFileThatItIs) {
+  keygen("mine");
+  EXPECT_EQ(sign("\xEF\xBB\xBF{\"version\": \"1\"}"), 0);
+  EXPECT_EQ(sign(""), 1);
+  expectOneErrorLine("the file is empty");
+}
+
+TEST_F(StorebagToolTest, outputThatCannotBeWrittenIsAFailure) {
+  keygen("mine");
+  ASSERT_EQ(sign("{\"version\": \"1\"}"), 0);
+  _scratch.write("bag", "{\"version\": \"1\", \"release\": {}}");
+  const std::string bag = _scratch.at("bag");
+  const std::string envelope = _scratch.at("envelope");
+  for (const auto& [command, file] : {std::pair("lint", bag), {"explain", bag}, {"show", envelope}}) {
+    std::ofstream full("/dev/full");
+    std::ostringstream errors;
+    const char* const arguments[] = {"telvane-storebag", command, file.c_str()};
+    EXPECT_EQ(StorebagTool(_files, full, errors).run(3, arguments), 1) << command;
+    EXPECT_EQ(errors.str(), "telvane-storebag: cannot write to standard output; see whether its disk is full\n");
+  }
 }
 
 TEST_F(StorebagToolTest, namesTheFileThatCannotBeUsed) {
