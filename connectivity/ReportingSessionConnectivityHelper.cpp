@@ -136,9 +136,10 @@ void ReportingSessionConnectivityHelper::incrementTotalSessionsServedCount() {
 }
 
 void ReportingSessionConnectivityHelper::ownerIncrementUsageCount() {
+  // Counted before this returns: the owner may already be about to hear that nobody is left, and reads the count then.
+  ++_usageCount;
   _stateQueue->async([self = shared_from_this()] {
     self->_stateQueue->assertOnQueue();
-    ++self->_usageCount;
     self->stopConnectivityHelperReleaseTimer();
     self->log().message(
         "ownerIncrementUsageCount: connectivity helper incremented usage count for NSURLSession with ID <{}>. "

@@ -63,6 +63,7 @@ class ReportingSessionConnectivityHelper : public ReportingSessionConnectivityIn
   // when there is none.
   void invalidate();
   void setReleaseTimeout(uint32_t seconds);
+  // The count has changed when this returns, on the caller's thread; the release timer is stopped later.
   void ownerIncrementUsageCount();
   // Tells the block, on the queue, how many owners are left: at once when some are, after the release time-out when
   // none is.

@@ -118,6 +118,7 @@ class TelvanedSession : public ClientSessionInterface, public std::enable_shared
   void receivedUserInfo(Value userInfo);
   bool isNameChanged(const Value& newUserInfo, const Key& nameKey) const;
   void updateUserInfoForBackends();
+  void activateHelperOfEnabledBackends();
   void createBackendsWithStorebag(const Dictionary& storebag);
   void updateSessionWithDefaultSessionInfo();
   void sendStartMessage();

@@ -101,9 +101,21 @@ void TelvanedSession::receivedUserInfo(Value userInfo) {
   }
   updateUserInfo(std::move(userInfo));
   updateUserInfoForBackends();
-  if (!isChanged) return;
+  if (!isChanged) {
+    activateHelperOfEnabledBackends();
+    return;
+  }
   log().message("receivedUserInfo: Received new user info for session {}", _sessionID);
   updateSessionWithDefaultSessionInfo();
+}
+
+// The pool may have given the helper up between its release and the new request, and a new one has no URL session yet.
+void TelvanedSession::activateHelperOfEnabledBackends() {
+  if (!_backends.has_value() || _connectivityHelper == nullptr) return;
+  const bool isAnyEnabled = std::any_of(_backends->begin(), _backends->end(), [](const auto& entry) {
+    return entry.second->state() == TelvaneBackendStateEnabled;
+  });
+  if (isAnyEnabled) _connectivityHelper->activate(_connectivityHelperReleaseTimeout);
 }
 
 void TelvanedSession::updateUserInfoForBackends() {

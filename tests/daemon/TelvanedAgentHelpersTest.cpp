@@ -128,5 +128,48 @@ TEST_F(TelvanedAgentHelpersTest, aDaemonThatEndsTakesNobodyIn) {
   EXPECT_EQ(process.transactions().begun(), 0);
 }
 
+// The pool is told that nobody is left by a job that has long been queued when a session asks for the helper. Which of
+// the two comes first is the seed's choice, so it is tried often.
+TEST_F(TelvanedAgentHelpersTest, aHelperThatIsAskedForWhenItsTimerFiresServesWhoAsked) {
+  constexpr int kAttempts = 200;
+  givenStorebag(StorebagBuilder().set(kStorebagReleaseTimeout, 1));
+  log().allowErrors();
+  for (int i = 0; i < kAttempts; ++i) {
+    const auto first = startSession();
+    const auto second = connect();
+    first->close();
+    world.scheduler().startTimer(SimulatedScheduler::kNoProcess, 1s, [&second] {
+      second->askInPassing(ClientSessionOperation::SetSessionInfo, {sessionInfo(), userInfo(), Value(), false});
+    });
+    world.advance(1s);
+    second->start();
+    second->send(7);
+    second->flush();
+    EXPECT_EQ(postedEvents(7, 1).size(), static_cast<size_t>(i) + 1);
+    second->close();
+    world.advance(1min);
+    ASSERT_EQ(process.transactions().open(), 0) << "attempt " << i;
+  }
+}
+
+TEST_F(TelvanedAgentHelpersTest, userInfoThatIsSentAgainAndAgainLosesNoEvent) {
+  constexpr int kAttempts = 200;
+  constexpr int kTimesInARow = 4;
+  givenStorebag(StorebagBuilder().set(kStorebagReleaseTimeout, 1));
+  log().allowErrors();
+  for (int i = 0; i < kAttempts; ++i) {
+    const auto client = startSession();
+    for (int times = 0; times < kTimesInARow; ++times) {
+      client->askInPassing(ClientSessionOperation::FetchStates, {userInfo()});
+    }
+    client->send(7);
+    client->flush();
+    EXPECT_EQ(postedEvents(7, 1).size(), static_cast<size_t>(i) + 1);
+    client->close();
+    world.advance(1min);
+    ASSERT_EQ(process.transactions().open(), 0) << "attempt " << i;
+  }
+}
+
 }  // namespace
 }  // namespace telvane::testing
