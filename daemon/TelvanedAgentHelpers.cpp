@@ -61,11 +61,13 @@ void TelvanedAgent::releaseHelper(const std::string& userInfoKey) {
       "userInfoKey {}",
       userInfoKey);
   found->second->ownerDecrementUsageCountWithBlock(
-      [self = shared_from_this(), userInfoKey](uint32_t usageCount) {
+      [self = shared_from_this(), userInfoKey, weakHelper = std::weak_ptr(found->second)](uint32_t usageCount) {
         self->_stateQueue->assertOnQueue();
         if (usageCount != 0) return;
         const auto unused = self->_sharedConnectivityHelpers.find(userInfoKey);
         if (unused == self->_sharedConnectivityHelpers.end()) return;
+        // A helper may say more than once that nobody uses it; by then the key may be that of its successor, in use.
+        if (unused->second != weakHelper.lock()) return;
         self->log().message(
             "releaseSharedConnectivityHelperForReportingSession: Usage count of shared connectivity helper for "
             "userInfoKey {} reached zero. Invalidating the helper",

@@ -171,5 +171,33 @@ TEST_F(TelvanedAgentHelpersTest, userInfoThatIsSentAgainAndAgainLosesNoEvent) {
   }
 }
 
+// Two sessions that end together may have the pool told at once that nobody is left, and once more by the release
+// timer.
+TEST_F(TelvanedAgentHelpersTest, aHelperThatIsGoneDoesNotTakeItsSuccessorAlong) {
+  constexpr int kAttempts = 50;
+  givenStorebag(StorebagBuilder().set(kStorebagReleaseTimeout, 2));
+  log().allowErrors();
+  startDaemon();
+  for (int i = 0; i < kAttempts; ++i) {
+    SimulatedPlatform& other = world.makeProcess("other", {.entitlements = {kTelvanedEntitlement}});
+    DaemonClient first(world, other);
+    DaemonClient second(world, other);
+    for (DaemonClient* client : {&first, &second}) {
+      client->setSessionInfo(sessionInfo(), userInfo());
+      client->start();
+    }
+    other.kill();
+    world.advance(1s);
+    const auto successor = startSession();
+    world.advance(3s);
+    successor->send(7);
+    successor->flush();
+    ASSERT_EQ(postedEvents(7, 1).size(), static_cast<size_t>(i) + 1) << "attempt " << i;
+    successor->close();
+    world.advance(1min);
+    ASSERT_EQ(process.transactions().open(), 0) << "attempt " << i;
+  }
+}
+
 }  // namespace
 }  // namespace telvane::testing

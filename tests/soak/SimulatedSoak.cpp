@@ -43,10 +43,19 @@ constexpr const char* kExpectedErrors[] = {
     "could not load storebag '",
 };
 
-const int64_t* soakNumber(const Value& event, int64_t& number) {
-  if (!event.isDictionary() || !event.dictionary()->contains(kNumber)) return nullptr;
-  number = (*event.dictionary())[kNumber].integerValue();
-  return &number;
+// The numbers of the events in a post's body that have one; those that a session sends by itself have none.
+std::vector<int64_t> soakNumbers(const Value& body) {
+  std::vector<int64_t> numbers;
+  const Array* events = body.isDictionary() ? (*body.dictionary())[kBodyEvents].array() : nullptr;
+  if (events == nullptr) {
+    ADD_FAILURE() << "a post without events";
+    return numbers;
+  }
+  for (const Value& event : *events) {
+    const Dictionary* fields = event.dictionary();
+    if (fields != nullptr && fields->contains(kNumber)) numbers.push_back((*fields)[kNumber].integerValue());
+  }
+  return numbers;
 }
 
 }  // namespace
@@ -89,10 +98,13 @@ void SimulatedSoak::startDaemon() {
 
 NetworkAnswer SimulatedSoak::answerPost(const URLRequest& request) {
   constexpr int kServiceUnavailable = 503;
+  const Value body = RecordingConnectivity::bodyValue(request);
+  const std::vector<int64_t> numbers = soakNumbers(body);
   SoakLedger::Answer fate = SoakLedger::Answer::Taken;
   NetworkAnswer answer = NetworkAnswer::ok().after(std::chrono::seconds(below(3)));
   const uint64_t chance = below(100);
-  if (chance < 4) {
+  // A post without a number could not be accounted to the session that it disables.
+  if (chance < 4 && !numbers.empty()) {
     fate = SoakLedger::Answer::ServerError;
     answer = NetworkAnswer::status(kServiceUnavailable).after(std::chrono::seconds(below(2)));
   } else if (chance < 10) {
@@ -104,16 +116,7 @@ NetworkAnswer SimulatedSoak::answerPost(const URLRequest& request) {
   } else if (chance < 16) {
     answer = NetworkAnswer::ok().after(std::chrono::seconds(10 + below(40)));
   }
-  const Value body = RecordingConnectivity::bodyValue(request);
-  const Array* events = body.isDictionary() ? (*body.dictionary())[kBodyEvents].array() : nullptr;
-  if (events == nullptr) {
-    ADD_FAILURE() << "a post without events";
-    return answer;
-  }
-  for (const Value& event : *events) {
-    int64_t number = 0;
-    if (soakNumber(event, number) != nullptr) _ledger.arrive(number, fate);
-  }
+  for (const int64_t number : numbers) _ledger.arrive(number, fate);
   return answer;
 }
 

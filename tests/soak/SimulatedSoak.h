@@ -33,6 +33,8 @@ class SimulatedSoak {
   void endAndCheck();
 
   const SoakLedger& ledger() const noexcept { return _ledger; }
+  // What everybody logged, for who looks for the reason of a failure.
+  const std::string& log() const noexcept { return _world.text(); }
   size_t killedProcesses() const noexcept { return _killedProcesses; }
   size_t cutOffSessions() const noexcept { return _cutOffSessions; }
 

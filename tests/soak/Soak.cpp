@@ -81,14 +81,31 @@ WireServer::Answer Soak::answer(const WireRequest& request) {
   return envelope != _envelopes.end() ? WireServer::answer(200, envelope->second) : WireServer::answer(404);
 }
 
+std::vector<int64_t> Soak::numbersIn(const WireRequest& request) {
+  URLRequest post;
+  post.headers.push_back({"Content-Encoding", request.header("Content-Encoding").value_or("")});
+  post.body = Data::copyOf(request.body);
+  const Value body = RecordingConnectivity::bodyValue(post);
+  const Array* events = body.isDictionary() ? (*body.dictionary())[kBodyEvents].array() : nullptr;
+  if (events == nullptr) fault("a post without events: " + request.head);
+  std::vector<int64_t> numbers;
+  for (const Value& event : events != nullptr ? *events : Array()) {
+    const Dictionary* fields = event.dictionary();
+    if (fields != nullptr && fields->contains(kNumber)) numbers.push_back((*fields)[kNumber].integerValue());
+  }
+  return numbers;
+}
+
 WireServer::Answer Soak::answerPost(const WireRequest& request) {
   WireServer::Answer result = WireServer::answer(200);
   SoakLedger::Answer fate = SoakLedger::Answer::Taken;
   std::chrono::milliseconds delay{};
   {
     const Lock lock(_mutex);
+    const std::vector<int64_t> numbers = numbersIn(request);
     const uint64_t chance = _serverChoice.below(100);
-    if (chance < 4) {
+    // A post without a number could not be accounted to the session that it disables.
+    if (chance < 4 && !numbers.empty()) {
       fate = SoakLedger::Answer::ServerError;
       result = WireServer::answer(503);
     } else if (chance < 10) {
@@ -97,16 +114,7 @@ WireServer::Answer Soak::answerPost(const WireRequest& request) {
     } else if (chance < 20) {
       delay = std::chrono::milliseconds(_serverChoice.below(1500));
     }
-    URLRequest post;
-    post.headers.push_back({"Content-Encoding", request.header("Content-Encoding").value_or("")});
-    post.body = Data::copyOf(request.body);
-    const Value body = RecordingConnectivity::bodyValue(post);
-    const Array* events = body.isDictionary() ? (*body.dictionary())[kBodyEvents].array() : nullptr;
-    if (events == nullptr) fault("a post without events: " + request.head);
-    for (const Value& event : events != nullptr ? *events : Array()) {
-      const Dictionary* fields = event.dictionary();
-      if (fields != nullptr && fields->contains(kNumber)) _ledger.arrive((*fields)[kNumber].integerValue(), fate);
-    }
+    for (const int64_t number : numbers) _ledger.arrive(number, fate);
   }
   std::this_thread::sleep_for(delay);  // a slow server, not a waiting test
   return result;
@@ -114,7 +122,7 @@ WireServer::Answer Soak::answerPost(const WireRequest& request) {
 
 std::vector<std::string> Soak::run() {
   const auto deadline = std::chrono::steady_clock::now() + _options.duration;
-  _instance.launchDaemon({"--log-level", "error", "--idle-exit", "0"});
+  _instance.launchDaemon({"--log-level", _options.logFile.empty() ? "error" : "info", "--idle-exit", "0"});
   if (!eventually([this] { return std::filesystem::exists(_instance.socketPath()); })) return {"no daemon"};
   do {
     runRound();
@@ -124,6 +132,7 @@ std::vector<std::string> Soak::run() {
     if (!_faults.empty()) break;
   } while (std::chrono::steady_clock::now() < deadline);
   stopDaemon();
+  if (!_options.logFile.empty()) std::filesystem::copy_file(_instance.path("daemon.err"), _options.logFile);
   checkLog();
   const Lock lock(_mutex);
   std::cout << "clients: " << _clientsMade << ", killed: " << _killed << "; " << _ledger.summary() << std::endl;

@@ -45,6 +45,8 @@ class Soak {
   void fault(std::string text) { _faults.push_back(std::move(text)); }
   WireServer::Answer answer(const WireRequest& request);
   WireServer::Answer answerPost(const WireRequest& request);
+  // The numbers of the events in a post that have one; those that a session sends by itself have none.
+  std::vector<int64_t> numbersIn(const WireRequest& request);
   void publishStorebags();
 
   void runRound();

@@ -17,6 +17,7 @@ int main(int argc, char** argv) {
   app.add_option("--clients", options.clients, "client processes at once")
       ->capture_default_str()
       ->check(CLI::Range(1, 64));
+  app.add_option("--log", options.logFile, "file that gets the daemon's whole log; errors only are logged without");
   CLI11_PARSE(app, argc, argv);
   options.duration = std::chrono::seconds(seconds);
   std::cout << "replay with --seed " << options.seed << std::endl;
