@@ -131,7 +131,7 @@ TEST_F(TelvanedAgentHelpersTest, aDaemonThatEndsTakesNobodyIn) {
 // The pool is told that nobody is left by a job that has long been queued when a session asks for the helper. Which of
 // the two comes first is the seed's choice, so it is tried often.
 TEST_F(TelvanedAgentHelpersTest, aHelperThatIsAskedForWhenItsTimerFiresServesWhoAsked) {
-  constexpr int kAttempts = 200;
+  constexpr int kAttempts = 40;
   givenStorebag(StorebagBuilder().set(kStorebagReleaseTimeout, 1));
   log().expectError("newBackendWithName): release_timeout");
   for (int i = 0; i < kAttempts; ++i) {
@@ -153,7 +153,7 @@ TEST_F(TelvanedAgentHelpersTest, aHelperThatIsAskedForWhenItsTimerFiresServesWho
 }
 
 TEST_F(TelvanedAgentHelpersTest, userInfoThatIsSentAgainAndAgainLosesNoEvent) {
-  constexpr int kAttempts = 200;
+  constexpr int kAttempts = 40;
   constexpr int kTimesInARow = 4;
   givenStorebag(StorebagBuilder().set(kStorebagReleaseTimeout, 1));
   log().expectError("newBackendWithName): release_timeout");
