@@ -105,8 +105,8 @@ TEST_F(CollectorStreamTest, a503ToOneBackendLeavesTheOthersAlone) {
 }
 
 TEST_F(CollectorStreamTest, anyAnswerButAServerErrorIsTaken) {
-  constexpr int kStatuses[] = {200, 204, 302, 400, 404, 413, 429, 499};
-  givenPostsAnsweredBy([&kStatuses](const WireRequest& post) {
+  static constexpr int kStatuses[] = {200, 204, 302, 400, 404, 413, 429, 499};
+  givenPostsAnsweredBy([](const WireRequest& post) {
     for (const Dictionary& event : eventsOf({post}, kEvent)) {
       return WireServer::answer(kStatuses[event["n"].integerValue()], "");
     }
