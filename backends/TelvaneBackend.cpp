@@ -4,6 +4,8 @@
 #include <array>
 
 #include "backends/HTTPSPostBackend.h"
+#include "backends/VDRBackend.h"
+#include "backends/WattbookBackend.h"
 #include "interfaces/BackendKind.h"
 #include "platform/Crypto.h"
 
@@ -41,14 +43,16 @@ bool hasEntryFor(const Value& list, uint16_t method) noexcept {
 std::shared_ptr<TelvaneBackend> TelvaneBackend::newBackendWithName(const ProcessContext& context, const String& name,
                                                                    const Value& profile,
                                                                    const std::optional<String>& productFamily,
-                                                                   uint32_t /*clientType*/) {
+                                                                   uint32_t clientType) {
   switch (kindForName(context, name)) {
     case BackendKind::HTTPSPost:
       return HTTPSPostBackend::initWithName(context, name, profile, productFamily);
+    case BackendKind::Wattbook:
+      return WattbookBackend::initWithName(context, name, profile, productFamily);
+    case BackendKind::VDR:
+      return VDRBackend::initWithName(context, name, profile, productFamily, clientType);
     case BackendKind::Dashboard:
     case BackendKind::UploadServer:
-    case BackendKind::Wattbook:
-    case BackendKind::VDR:
     case BackendKind::Unknown:
       break;  // not built yet, or no backend at all
   }
@@ -132,7 +136,7 @@ std::optional<String> TelvaneBackend::flushMessagesWithCompletion(FlushCompletio
   return std::nullopt;
 }
 
-bool TelvaneBackend::uploadFileAtPath(const String&, int) { return false; }
+bool TelvaneBackend::uploadFileAtPath(const String&, const ExtensionToken&) { return false; }
 
 bool TelvaneBackend::uploadLogData(const Array&) { return false; }
 

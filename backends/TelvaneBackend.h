@@ -8,6 +8,7 @@
 
 #include "backends/GateObserver.h"
 #include "connectivity/ReportingSessionConnectivityInterface.h"
+#include "foundation/ExtensionToken.h"
 #include "foundation/Value.h"
 #include "platform/Dispatch.h"
 #include "platform/Mutex.h"
@@ -68,8 +69,9 @@ class TelvaneBackend : public std::enable_shared_from_this<TelvaneBackend> {
   void setStartTimestamp(Date timestamp);
   // completion may be empty; it is called at most once, from any thread.
   virtual std::optional<String> flushMessagesWithCompletion(FlushCompletion completion);
-  // extensionToken: a descriptor of the file, borrowed; -1 when there is none.
-  virtual bool uploadFileAtPath(const String& path, int extensionToken);
+  // Returns whether this kind uploads files and took this one. extensionToken: the client's right to read it, borrowed
+  // for the length of the call.
+  virtual bool uploadFileAtPath(const String& path, const ExtensionToken& extensionToken);
   virtual bool uploadLogData(const Array& logData);
   virtual void setCorrelatedSessionID(const String& combinedSessionID);
   bool isWhitelistedEvent(uint16_t method) const;

@@ -32,8 +32,8 @@ ClientRuntime& ClientRuntime::current() {
 uint64_t ClientRuntime::processGeneration() noexcept { return generation.load(std::memory_order_relaxed); }
 
 ClientRuntime::ClientRuntime()
-    : _context(ClientPlatform(_platform.dispatch(), _platform.log(), _platform.random(), _platform.userDefaults(),
-                              _platform.localService())),
+    : _context(ClientPlatform(_platform.clock(), _platform.dispatch(), _platform.log(), _platform.random(),
+                              _platform.userDefaults(), _platform.localService())),
       _oneShotSender(_context) {}
 
 void ClientRuntime::add(const std::shared_ptr<ClientSession>& session) {

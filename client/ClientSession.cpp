@@ -365,9 +365,11 @@ bool ClientSession::uploadFileWithURL(const String& fileURL, Telvane::UploadBloc
   auto step = [self = shared_from_this(), url = String(fileURLOfPath(path)), extension = std::move(*extension),
                completion = std::move(completionHandler)]() mutable {
     self->proxy("uploadFileWithURL")
-        .uploadFileAtPath(url, extension.release(), [self, completion = std::move(completion)](bool isSuccess) mutable {
-          if (completion) self->_context.callOut("uploadFileWithURL", [&] { completion(isSuccess, std::nullopt); });
-        });
+        .uploadFileAtPath(url, {.descriptor = extension.release()},
+                          [self, completion = std::move(completion)](bool isSuccess) mutable {
+                            if (completion)
+                              self->_context.callOut("uploadFileWithURL", [&] { completion(isSuccess, std::nullopt); });
+                          });
   };
   _reportingQueue->perform(std::move(step));
   return true;

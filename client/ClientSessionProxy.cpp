@@ -72,10 +72,10 @@ void ClientSessionProxy::flushMessagesWithCompletion(FlushReply completion) {
 
 void ClientSessionProxy::finishSessionGracefully() { send(ClientSessionOperation::FinishSessionGracefully, {}); }
 
-void ClientSessionProxy::uploadFileAtPath(String fileURL, int extensionToken,
+void ClientSessionProxy::uploadFileAtPath(String fileURL, ExtensionToken extensionToken,
                                           UniqueFunction<void(bool)> completionHandler) {
   ipc::Invocation call = invocation(ClientSessionOperation::UploadFileAtPath, {std::move(fileURL)});
-  call.descriptor = ipc::Descriptor(extensionToken);
+  call.descriptor = ipc::Descriptor(extensionToken.descriptor);
   _connection.sendWithReply(
       std::move(call),
       [completionHandler = std::move(completionHandler)](Array values) mutable {

@@ -29,7 +29,8 @@ class ClientSessionProxy final : public ClientSessionInterface {
   void sendMessageWithDictionary(Dictionary message, MessageReply reply) override;
   void flushMessagesWithCompletion(FlushReply completion) override;
   void finishSessionGracefully() override;
-  void uploadFileAtPath(String fileURL, int extensionToken, UniqueFunction<void(bool)> completionHandler) override;
+  void uploadFileAtPath(String fileURL, ExtensionToken extensionToken,
+                        UniqueFunction<void(bool)> completionHandler) override;
   void uploadLogData(Array logData,
                      UniqueFunction<void(bool success, std::optional<Error> error)> completionHandler) override;
   void sendMessageWithSessionInfo(Dictionary sessionInfo, Value userInfo, uint16_t category, uint16_t type,

@@ -37,7 +37,8 @@ bool TelvanedAgent::listener(ipc::Listener&, std::shared_ptr<ipc::Connection> sh
                   connection->description(), _sessionList.size(), _correlatedSessions.size());
   }
   auto session = createReportingSessionWithDelegate(shared_from_this(), connection);
-  connection->setExportedObject(std::make_shared<ClientSessionDispatcher>(log(), session, shared_from_this()));
+  connection->setExportedObject(
+      std::make_shared<ClientSessionDispatcher>(log(), session, shared_from_this(), connection->peerIdentity()));
   connection->setInterruptionHandler([&log = log(), weakSession = std::weak_ptr(session)] {
     const auto interrupted = weakSession.lock();
     if (interrupted == nullptr) return;

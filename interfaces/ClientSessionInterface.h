@@ -4,6 +4,7 @@
 #include <optional>
 
 #include "foundation/Error.h"
+#include "foundation/ExtensionToken.h"
 #include "foundation/UniqueFunction.h"
 #include "foundation/Value.h"
 
@@ -56,8 +57,9 @@ class ClientSessionInterface {
   virtual void sendMessageWithDictionary(Dictionary message, MessageReply reply) = 0;
   virtual void flushMessagesWithCompletion(FlushReply completion) = 0;
   virtual void finishSessionGracefully() = 0;
-  // extensionToken: an open descriptor of the file, borrowed for the length of the call; -1 when none was handed over.
-  virtual void uploadFileAtPath(String fileURL, int extensionToken, UniqueFunction<void(bool)> completionHandler) = 0;
+  // extensionToken: borrowed for the length of the call; from a client, its descriptor is given away with it.
+  virtual void uploadFileAtPath(String fileURL, ExtensionToken extensionToken,
+                                UniqueFunction<void(bool)> completionHandler) = 0;
   virtual void uploadLogData(Array logData,
                              UniqueFunction<void(bool success, std::optional<Error> error)> completionHandler) = 0;
   virtual void sendMessageWithSessionInfo(Dictionary sessionInfo, Value userInfo, uint16_t category, uint16_t type,

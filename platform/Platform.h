@@ -18,6 +18,11 @@
 
 namespace telvane {
 
+class DatagramSockets;
+class PowerLog;
+class SandboxExtensions;
+class WirelessDiagnostics;
+
 // Everything that a program needs of the system it runs on, as seams that a test can replace one by one. Made by the
 // entry point, handed down by reference, outlives everything that it is handed to. Owns nothing itself.
 struct Platform {
@@ -36,6 +41,11 @@ struct Platform {
   ipc::Service& localService;
   SubmittableLogs& submittableLogs;
   ProcessMemory& processMemory;
+  // Each is needed in one place only, which includes its header.
+  DatagramSockets& datagramSockets;
+  SandboxExtensions& sandboxExtensions;
+  WirelessDiagnostics& wirelessDiagnostics;
+  PowerLog& powerLog;
 };
 
 }  // namespace telvane

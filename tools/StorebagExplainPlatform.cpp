@@ -142,7 +142,11 @@ struct StorebagExplainPlatform::Parts {
             real.transactions,
             real.localService,
             real.submittableLogs,
-            real.processMemory};
+            real.processMemory,
+            real.datagramSockets,
+            real.sandboxExtensions,
+            real.wirelessDiagnostics,
+            real.powerLog};
   }
 
   const StorebagExplainCase situation;

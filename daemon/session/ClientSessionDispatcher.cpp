@@ -38,8 +38,8 @@ MessageReply messageReply(ipc::ReplyBlock reply) {
 }  // namespace
 
 ClientSessionDispatcher::ClientSessionDispatcher(Log& log, std::shared_ptr<ClientSessionInterface> session,
-                                                 std::shared_ptr<DaemonStatusProvider> status)
-    : _log(log), _session(std::move(session)), _status(std::move(status)) {}
+                                                 std::shared_ptr<DaemonStatusProvider> status, PeerIdentity client)
+    : _log(log), _session(std::move(session)), _status(std::move(status)), _client(std::move(client)) {}
 
 void ClientSessionDispatcher::invoke(ipc::Invocation invocation, ipc::ReplyBlock reply) {
   Array& arguments = invocation.arguments;
@@ -87,7 +87,7 @@ void ClientSessionDispatcher::invoke(ipc::Invocation invocation, ipc::ReplyBlock
 
 void ClientSessionDispatcher::invokeUpload(const ipc::Invocation& invocation, ipc::ReplyBlock reply) {
   _session->uploadFileAtPath(invocation.arguments[0].isString() ? *invocation.arguments[0].string() : String(),
-                             invocation.descriptor.get(), singleReply<bool>(std::move(reply)));
+                             {invocation.descriptor.get(), _client}, singleReply<bool>(std::move(reply)));
 }
 
 void ClientSessionDispatcher::invokeOneMessage(const Array& arguments, ipc::ReplyBlock reply) {

@@ -23,7 +23,7 @@ class DaemonStatusProvider {
 class ClientSessionDispatcher : public ipc::ExportedObject {
  public:
   ClientSessionDispatcher(Log& log, std::shared_ptr<ClientSessionInterface> session,
-                          std::shared_ptr<DaemonStatusProvider> status);
+                          std::shared_ptr<DaemonStatusProvider> status, PeerIdentity client);
   void invoke(ipc::Invocation invocation, ipc::ReplyBlock reply) override;
 
  private:
@@ -33,6 +33,7 @@ class ClientSessionDispatcher : public ipc::ExportedObject {
   Log& _log;
   const std::shared_ptr<ClientSessionInterface> _session;
   const std::shared_ptr<DaemonStatusProvider> _status;
+  const PeerIdentity _client;
 };
 
 }  // namespace telvane

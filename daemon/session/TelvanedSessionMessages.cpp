@@ -189,7 +189,7 @@ void TelvanedSession::internalFlushMessagesWithCompletion(FlushReply completion)
   }
 }
 
-void TelvanedSession::uploadFileAtPath(String fileURL, int extensionToken,
+void TelvanedSession::uploadFileAtPath(String fileURL, ExtensionToken extensionToken,
                                        UniqueFunction<void(bool)> completionHandler) {
   log().message("uploadFileAtPath: Uploading file for session {}", _sessionID);
   const std::string path = pathOfFileURL(fileURL);

@@ -4,6 +4,7 @@ target_sources(telvane_platform PRIVATE
   ${CMAKE_CURRENT_LIST_DIR}/Dispatch.cpp
   ${CMAKE_CURRENT_LIST_DIR}/FlowGate.cpp
   ${CMAKE_CURRENT_LIST_DIR}/Random.cpp
+  ${CMAKE_CURRENT_LIST_DIR}/RepeatingTimer.cpp
   ${CMAKE_CURRENT_LIST_DIR}/SystemClock.cpp
   ${CMAKE_CURRENT_LIST_DIR}/SystemRandom.cpp
   ${CMAKE_CURRENT_LIST_DIR}/Thread.cpp

@@ -7,6 +7,7 @@
 #include <utility>
 
 #include "foundation/Error.h"
+#include "foundation/ExtensionToken.h"
 #include "foundation/UniqueFunction.h"
 #include "foundation/Value.h"
 
@@ -89,6 +90,8 @@ class Connection {
   virtual void invalidate() = 0;
   // Whether the other process holds the named entitlement as a boolean that is true. REQUIRES: accepting side.
   virtual bool peerHasEntitlement(const std::string& name) const = 0;
+  // The user and groups of the other process when it connected. REQUIRES: accepting side.
+  virtual PeerIdentity peerIdentity() const = 0;
   // Names the other end in log lines: "pid 123 (/usr/bin/app)".
   virtual std::string description() const = 0;
 };

@@ -59,6 +59,10 @@ bool SocketConnection::peerHasEntitlement(const std::string& name) const {
   return _entitlements != nullptr && _entitlements->isGranted(name, _peer);
 }
 
+PeerIdentity SocketConnection::peerIdentity() const {
+  return {_peer.userID, _peer.groupID, {_peer.supplementaryGroups.begin(), _peer.supplementaryGroups.end()}};
+}
+
 std::string SocketConnection::description() const { return _core->description(); }
 
 }  // namespace telvane::ipc

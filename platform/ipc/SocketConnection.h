@@ -36,6 +36,7 @@ class SocketConnection final : public Connection {
   void sendWithReply(Invocation invocation, ReplyBlock reply, ErrorHandler onError) override;
   void invalidate() override;
   bool peerHasEntitlement(const std::string& name) const override;
+  PeerIdentity peerIdentity() const override;
   std::string description() const override;
 
  private:

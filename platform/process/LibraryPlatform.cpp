@@ -1,5 +1,6 @@
 #include "platform/process/LibraryPlatform.h"
 
+#include "platform/dispatch/SystemClock.h"
 #include "platform/dispatch/SystemRandom.h"
 #include "platform/dispatch/ThreadedDispatch.h"
 #include "platform/ipc/Entitlements.h"
@@ -36,6 +37,7 @@ struct LibraryPlatform::Parts {
         localService(files, dispatch, *log, entitlements) {}
 
   const std::unique_ptr<Log> log;
+  SystemClock clock;
   ThreadedDispatch dispatch;
   SystemRandom random;
   PosixFileSystem files;
@@ -47,6 +49,8 @@ struct LibraryPlatform::Parts {
 LibraryPlatform::LibraryPlatform() : _parts(std::make_unique<Parts>(Paths::fromEnvironment(Environment::read()))) {}
 
 LibraryPlatform::~LibraryPlatform() = default;
+
+Clock& LibraryPlatform::clock() noexcept { return _parts->clock; }
 
 Dispatch& LibraryPlatform::dispatch() noexcept { return _parts->dispatch; }
 Log& LibraryPlatform::log() noexcept { return *_parts->log; }

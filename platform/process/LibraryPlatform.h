@@ -3,6 +3,7 @@
 #include <chrono>
 #include <memory>
 
+#include "platform/Clock.h"
 #include "platform/Dispatch.h"
 #include "platform/Log.h"
 #include "platform/Random.h"
@@ -23,6 +24,7 @@ class LibraryPlatform {
   // REQUIRES: nothing that it handed out is used any more.
   ~LibraryPlatform();
 
+  Clock& clock() noexcept;
   Dispatch& dispatch() noexcept;
   Log& log() noexcept;
   Random& random() noexcept;

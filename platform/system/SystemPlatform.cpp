@@ -1,14 +1,18 @@
 #include "platform/system/SystemPlatform.h"
 
+#include "platform/PowerLog.h"
+#include "platform/datagram/SystemDatagramSockets.h"
 #include "platform/dispatch/SystemClock.h"
 #include "platform/dispatch/SystemRandom.h"
 #include "platform/dispatch/ThreadedDispatch.h"
 #include "platform/ipc/Entitlements.h"
 #include "platform/ipc/SocketService.h"
 #include "platform/system/DefaultsConsent.h"
+#include "platform/system/DescriptorExtensions.h"
 #include "platform/system/Environment.h"
 #include "platform/system/FolderClientBundle.h"
 #include "platform/system/FolderSubmittableLogs.h"
+#include "platform/system/LoadedWirelessDiagnostics.h"
 #include "platform/system/Paths.h"
 #include "platform/system/PosixFileSystem.h"
 #include "platform/system/PropertyListUserDefaults.h"
@@ -32,10 +36,28 @@ struct SystemPlatform::Parts {
         clientBundle(FolderClientBundle::folderFor(environment, paths), log),
         urlSessions(dispatch, log, &flowGate, {.caFile = environment.certificates.value_or("")}),
         submittableLogs(paths),
+        wirelessDiagnostics(paths, log),
         entitlements(files, log),
         localService(files, dispatch, log, entitlements, &flowGate),
-        platform{clock,   random,       dispatch,    log,          files,        userDefaults,    deviceAnswers, locale,
-                 consent, clientBundle, urlSessions, transactions, localService, submittableLogs, processMemory} {}
+        platform{clock,
+                 random,
+                 dispatch,
+                 log,
+                 files,
+                 userDefaults,
+                 deviceAnswers,
+                 locale,
+                 consent,
+                 clientBundle,
+                 urlSessions,
+                 transactions,
+                 localService,
+                 submittableLogs,
+                 processMemory,
+                 datagramSockets,
+                 sandboxExtensions,
+                 wirelessDiagnostics,
+                 powerLog} {}
 
   SystemClock clock;
   SystemRandom random;
@@ -51,6 +73,10 @@ struct SystemPlatform::Parts {
   CurlURLSessionProvider urlSessions;
   FolderSubmittableLogs submittableLogs;
   SystemProcessMemory processMemory;
+  SystemDatagramSockets datagramSockets;
+  DescriptorExtensions sandboxExtensions;
+  LoadedWirelessDiagnostics wirelessDiagnostics;
+  NullPowerLog powerLog;
   ipc::Entitlements entitlements;
   ipc::SocketService localService;
   const Platform platform;

@@ -4,10 +4,12 @@ target_sources(telvane_platform PRIVATE
   ${CMAKE_CURRENT_LIST_DIR}/Compression.cpp
   ${CMAKE_CURRENT_LIST_DIR}/Crypto.cpp
   ${CMAKE_CURRENT_LIST_DIR}/DefaultsConsent.cpp
+  ${CMAKE_CURRENT_LIST_DIR}/DescriptorExtensions.cpp
   ${CMAKE_CURRENT_LIST_DIR}/DictionaryFiles.cpp
   ${CMAKE_CURRENT_LIST_DIR}/Environment.cpp
   ${CMAKE_CURRENT_LIST_DIR}/FileAccess.cpp
   ${CMAKE_CURRENT_LIST_DIR}/FileDescriptor.cpp
+  ${CMAKE_CURRENT_LIST_DIR}/FileRemoval.cpp
   ${CMAKE_CURRENT_LIST_DIR}/FileTimes.cpp
   ${CMAKE_CURRENT_LIST_DIR}/FolderClientBundle.cpp
   ${CMAKE_CURRENT_LIST_DIR}/FolderSubmittableLogs.cpp
@@ -15,6 +17,8 @@ target_sources(telvane_platform PRIVATE
   ${CMAKE_CURRENT_LIST_DIR}/JSONWriter.cpp
   ${CMAKE_CURRENT_LIST_DIR}/Paths.cpp
   ${CMAKE_CURRENT_LIST_DIR}/PlatformError.cpp
+  ${CMAKE_CURRENT_LIST_DIR}/KeyedArchive.cpp
+  ${CMAKE_CURRENT_LIST_DIR}/LoadedWirelessDiagnostics.cpp
   ${CMAKE_CURRENT_LIST_DIR}/PosixFileSystem.cpp
   ${CMAKE_CURRENT_LIST_DIR}/ProcessIdentifier.cpp
   ${CMAKE_CURRENT_LIST_DIR}/ProcessTransactions.cpp
@@ -31,6 +35,7 @@ target_sources(telvane_platform PRIVATE
   ${CMAKE_CURRENT_LIST_DIR}/SystemProcessMemory.cpp
   ${CMAKE_CURRENT_LIST_DIR}/TerminationSignals.cpp
   ${CMAKE_CURRENT_LIST_DIR}/UTF8.cpp
+  ${CMAKE_CURRENT_LIST_DIR}/UnnamedFile.cpp
 )
 target_link_libraries(telvane_platform PRIVATE
   OpenSSL::Crypto PkgConfig::LIBPLIST PkgConfig::LIBSYSTEMD PkgConfig::RAPIDJSON ZLIB::ZLIB)

@@ -57,7 +57,7 @@ TEST_F(BackendCreationTest, anEmptySectionMakesNone) { EXPECT_TRUE(create({}).em
 
 TEST_F(BackendCreationTest, entriesThatAreNoBackendsAreLeftOut) {
   log().expectError("TelvaneBackend(newBackendWithName): release_timeout");
-  log().expectError("TelvaneBackend(newBackendWithName): vdr");
+  log().expectError("VDRBackend(initWithName): No matching bundle found for client type 6");
   const BackendTable table = create({{Key("vdr"), Dictionary{{Key("active"), true}}},
                                      {Key("release_timeout"), 60},
                                      {Key("my-splunk"), profile()},
@@ -67,6 +67,21 @@ TEST_F(BackendCreationTest, entriesThatAreNoBackendsAreLeftOut) {
   EXPECT_EQ(table[0].first, "my-splunk");
   EXPECT_EQ(table[0].second->name(), "my-splunk");
   EXPECT_EQ(table[1].first, "gonzo");
+}
+
+TEST_F(BackendCreationTest, theSectionOfTheBuiltInBagMakesOneBackendForThoseClientTypesThatItIsFor) {
+  log().expectError("TelvaneBackend(newBackendWithName): release_timeout");
+  const Dictionary builtIn{{Key("vdr"), Dictionary{{kProfileActive, true}}}, {Key("release_timeout"), 60}};
+  for (const int32_t type : {7, 11, 13}) {
+    _sessionInfo.set(kTelvaneSessionInfoClientType, type);
+    const BackendTable table = create(builtIn);
+    ASSERT_EQ(table.size(), 1u) << type;
+    EXPECT_EQ(table[0].first, "vdr");
+  }
+  // The type 20 shares the bag with them.
+  log().expectError("VDRBackend(initWithName): No matching bundle found for client type 20");
+  _sessionInfo.set(kTelvaneSessionInfoClientType, 20);
+  EXPECT_TRUE(create(builtIn).empty());
 }
 
 TEST_F(BackendCreationTest, aDeviceWithoutANameHasNoHTTPSBackend) {
@@ -157,7 +172,11 @@ TEST_F(BackendCreationTest, allBackendsOfACallStartAtTheSameTime) {
                    base.transactions,
                    base.localService,
                    base.submittableLogs,
-                   base.processMemory};
+                   base.processMemory,
+                   base.datagramSockets,
+                   base.sandboxExtensions,
+                   base.wirelessDiagnostics,
+                   base.powerLog};
   const ProcessContext tickingContext{ticking};
   const Dictionary both{{Key("splunk"), profile()}, {Key("gonzo"), profile()}};
   const auto table = createBackends(tickingContext, both, _sessionInfo, _userInfo, "device-id");

@@ -10,14 +10,25 @@ namespace telvane::testing {
 namespace {
 
 Platform withRandom(const Platform& platform, Random& random) {
-  return {platform.clock,         random,
-          platform.dispatch,      platform.log,
-          platform.files,         platform.userDefaults,
-          platform.deviceAnswers, platform.locale,
-          platform.consent,       platform.clientBundle,
-          platform.urlSessions,   platform.transactions,
-          platform.localService,  platform.submittableLogs,
-          platform.processMemory};
+  return {platform.clock,
+          random,
+          platform.dispatch,
+          platform.log,
+          platform.files,
+          platform.userDefaults,
+          platform.deviceAnswers,
+          platform.locale,
+          platform.consent,
+          platform.clientBundle,
+          platform.urlSessions,
+          platform.transactions,
+          platform.localService,
+          platform.submittableLogs,
+          platform.processMemory,
+          platform.datagramSockets,
+          platform.sandboxExtensions,
+          platform.wirelessDiagnostics,
+          platform.powerLog};
 }
 
 }  // namespace

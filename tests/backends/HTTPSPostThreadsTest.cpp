@@ -52,7 +52,11 @@ class HTTPSPostThreadsTest : public BackendFixture {
             base.transactions,
             base.localService,
             base.submittableLogs,
-            base.processMemory};
+            base.processMemory,
+            base.datagramSockets,
+            base.sandboxExtensions,
+            base.wirelessDiagnostics,
+            base.powerLog};
   }
 
   SystemClock _clock;

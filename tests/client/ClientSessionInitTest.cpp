@@ -108,7 +108,8 @@ TEST_F(ClientSessionInitTest, refusesWhereTheServiceMustNotBeLookedUp) {
 TEST_F(ClientSessionInitTest, refusesWithoutResourcesForAConnection) {
   NoConnections none;
   const Platform& platform = client().platform();
-  ClientContext context{ClientPlatform(platform.dispatch, platform.log, platform.random, platform.userDefaults, none)};
+  ClientContext context{
+      ClientPlatform(platform.clock, platform.dispatch, platform.log, platform.random, platform.userDefaults, none)};
   log().expectError("initWithSessionInfo: Failed to connect to daemon");
   EXPECT_EQ(TelvaneFactory::initWithSessionInfo(context, sessionInfo()), nullptr);
 }
@@ -116,8 +117,8 @@ TEST_F(ClientSessionInitTest, refusesWithoutResourcesForAConnection) {
 TEST_F(ClientSessionInitTest, letsTheConnectionGoWhenThereIsNoQueue) {
   NoSerialQueues none(client().platform().dispatch);
   const Platform& platform = client().platform();
-  ClientContext context{
-      ClientPlatform(none, platform.log, platform.random, platform.userDefaults, platform.localService)};
+  ClientContext context{ClientPlatform(platform.clock, none, platform.log, platform.random, platform.userDefaults,
+                                       platform.localService)};
   log().expectError("initWithSessionInfo: Failed to create reporting queue");
   EXPECT_EQ(TelvaneFactory::initWithSessionInfo(context, sessionInfo()), nullptr);
   run();

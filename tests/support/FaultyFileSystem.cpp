@@ -30,6 +30,26 @@ class FaultyFileSystem::OpenFile final : public AppendableFile {
   const std::unique_ptr<AppendableFile> _target;
 };
 
+class FaultyFileSystem::OpenTemporaryFile final : public TemporaryFile {
+ public:
+  OpenTemporaryFile(const FaultyFileSystem& files, std::string folder, std::unique_ptr<TemporaryFile> target)
+      : _files(files), _folder(std::move(folder)), _target(std::move(target)) {}
+  uint64_t size() const noexcept override { return _target->size(); }
+  int64_t read(uint64_t offset, std::span<char> buffer) const override {
+    return _files.readFault(_folder) ? -1 : _target->read(offset, buffer);
+  }
+  Result<void> append(std::string_view bytes) override {
+    if (auto fault = _files.writeFault(_folder)) return *std::move(fault);
+    if (_files.isDiskFull()) return failure(ENOSPC, _folder);
+    return _target->append(bytes);
+  }
+
+ private:
+  const FaultyFileSystem& _files;
+  const std::string _folder;
+  const std::unique_ptr<TemporaryFile> _target;
+};
+
 void FaultyFileSystem::failReads(int errorNumber, std::string pathPart) {
   MutexLock lock(_mutex);
   _readFaults.push_back(Fault{errorNumber, std::move(pathPart)});
@@ -76,6 +96,13 @@ Result<std::unique_ptr<AppendableFile>> FaultyFileSystem::openForAppending(const
   Result<std::unique_ptr<AppendableFile>> opened = _target.openForAppending(path);
   if (!opened) return opened;
   return std::unique_ptr<AppendableFile>(std::make_unique<OpenFile>(*this, path, std::move(*opened)));
+}
+
+Result<std::unique_ptr<TemporaryFile>> FaultyFileSystem::newTemporaryFile(const std::string& folder) {
+  if (auto fault = writeFault(folder)) return *std::move(fault);
+  Result<std::unique_ptr<TemporaryFile>> made = _target.newTemporaryFile(folder);
+  if (!made) return made;
+  return std::unique_ptr<TemporaryFile>(std::make_unique<OpenTemporaryFile>(*this, folder, std::move(*made)));
 }
 
 Result<void> FaultyFileSystem::createDirectory(const std::string& path) {

@@ -31,6 +31,8 @@ class FaultyFileSystem final : public FileSystem {
   Result<void> write(const std::string& path, const Data& data) override;
   // The file that it opens feels the faults too, also those that come later.
   Result<std::unique_ptr<AppendableFile>> openForAppending(const std::string& path) override;
+  // So does a temporary one, in the folder that it was made for.
+  Result<std::unique_ptr<TemporaryFile>> newTemporaryFile(const std::string& folder) override;
   Result<void> createDirectory(const std::string& path) override;
   Result<void> remove(const std::string& path) override;
   std::optional<Date> modificationDate(const std::string& path) const override;
@@ -41,6 +43,7 @@ class FaultyFileSystem final : public FileSystem {
 
  private:
   class OpenFile;
+  class OpenTemporaryFile;
   struct Fault {
     int errorNumber;
     std::string pathPart;

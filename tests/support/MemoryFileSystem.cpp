@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 #include <filesystem>
@@ -33,6 +34,22 @@ class MemoryFileSystem::OpenFile final : public AppendableFile {
  private:
   MemoryFileSystem& _files;
   const std::string _resolved;
+};
+
+class MemoryFileSystem::BufferFile final : public TemporaryFile {
+ public:
+  uint64_t size() const noexcept override { return _bytes.size(); }
+  int64_t read(uint64_t offset, std::span<char> buffer) const override {
+    const std::string_view rest = std::string_view(_bytes).substr(std::min<uint64_t>(offset, _bytes.size()));
+    return static_cast<int64_t>(rest.copy(buffer.data(), buffer.size()));
+  }
+  Result<void> append(std::string_view bytes) override {
+    _bytes += bytes;
+    return {};
+  }
+
+ private:
+  std::string _bytes;
 };
 
 MemoryFileSystem::MemoryFileSystem(const Clock& clock, std::string root) : _clock(clock), _root(std::move(root)) {
@@ -103,6 +120,12 @@ Result<void> MemoryFileSystem::append(const std::string& resolved, std::string_v
   found->second.content = Data(std::string(found->second.content.view()).append(text));
   found->second.modified = _clock.now();
   return {};
+}
+
+Result<std::unique_ptr<TemporaryFile>> MemoryFileSystem::newTemporaryFile(const std::string& folder) {
+  const Result<void> made = createDirectory(folder);
+  if (!made) return made.error();
+  return std::unique_ptr<TemporaryFile>(std::make_unique<BufferFile>());
 }
 
 Result<void> MemoryFileSystem::createDirectory(const std::string& path) {

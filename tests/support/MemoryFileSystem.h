@@ -25,6 +25,7 @@ class MemoryFileSystem final : public FileSystem {
   Result<void> writeAtomically(const std::string& path, const Data& data) override;
   Result<void> write(const std::string& path, const Data& data) override;
   Result<std::unique_ptr<AppendableFile>> openForAppending(const std::string& path) override;
+  Result<std::unique_ptr<TemporaryFile>> newTemporaryFile(const std::string& folder) override;
   Result<void> createDirectory(const std::string& path) override;
   // Removes a file, or a folder that is empty.
   Result<void> remove(const std::string& path) override;
@@ -53,6 +54,7 @@ class MemoryFileSystem final : public FileSystem {
     std::optional<Date> created;
   };
   class OpenFile;
+  class BufferFile;
   void addFolders(const std::string& resolved) REQUIRES(_mutex);
   // A file of that name keeps its creation date.
   void setContent(const std::string& resolved, const Data& data) REQUIRES(_mutex);

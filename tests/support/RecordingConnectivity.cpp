@@ -5,6 +5,7 @@
 #include "interfaces/EventKeys.h"
 #include "platform/Compression.h"
 #include "platform/JSON.h"
+#include "tests/support/BodyBytes.h"
 
 namespace telvane::testing {
 namespace {
@@ -31,8 +32,9 @@ URLRequest RecordingConnectivity::request(size_t index) const {
 URLRequest RecordingConnectivity::lastRequest() const { return request(count() - 1); }
 
 std::string RecordingConnectivity::bodyText(const URLRequest& request) {
-  if (header(request, "Content-Encoding") != "gzip") return std::string(request.body.view());
-  const Result<Data> plain = compression::inflate(request.body.view(), kLargestBody);
+  const Data body = bodyBytes(request);
+  if (header(request, "Content-Encoding") != "gzip") return std::string(body.view());
+  const Result<Data> plain = compression::inflate(body.view(), kLargestBody);
   return plain.has_value() ? std::string(plain->view()) : std::string();
 }
 

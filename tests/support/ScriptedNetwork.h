@@ -26,7 +26,7 @@ struct RecordedRequest {
   std::string taskDescription;
   URLRequest request;  // of an upload, with the file's bytes as the body
   URLSessionConfiguration configuration;
-  bool isUpload = false;
+  bool isUpload = false;  // the body is a file
   SimulatedScheduler::Time resumedAt;
   // When it left, later than resumedAt if it waited for connectivity; nothing if it has not left.
   std::optional<SimulatedScheduler::Time> leftAt;

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <utility>
 
+#include "tests/support/BodyBytes.h"
 #include "tests/support/ScriptedURLSessionTask.h"
 
 namespace telvane::testing {
@@ -16,7 +17,10 @@ ScriptedURLSession::ScriptedURLSession(ScriptedURLSessionEnvironment environment
       _delegate(std::move(delegate)) {}
 
 Result<std::shared_ptr<URLSessionTask>> ScriptedURLSession::newDataTask(URLRequest request) {
-  return newTask(std::move(request), false);
+  const bool isUpload = request.bodyFile != nullptr;
+  if (isUpload) request.body = bodyBytes(request);
+  request.bodyFile = nullptr;
+  return newTask(std::move(request), isUpload);
 }
 
 Result<std::shared_ptr<URLSessionTask>> ScriptedURLSession::newUploadTask(URLRequest request, const std::string& path) {

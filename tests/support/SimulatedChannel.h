@@ -22,6 +22,7 @@ struct SimulatedPeer {
   SimulatedDispatch* dispatch = nullptr;
   FlowGate* gate = nullptr;  // may be null: always open
   bool isAlive = true;
+  PeerIdentity identity{};
 };
 
 // What goes through a channel.

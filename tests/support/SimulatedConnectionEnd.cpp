@@ -260,6 +260,10 @@ bool SimulatedConnectionEnd::peerHasEntitlement(const std::string& name) const {
   return _side == Side::Accepting && _other != nullptr && _other->entitlements.count(name) != 0;
 }
 
+PeerIdentity SimulatedConnectionEnd::peerIdentity() const {
+  return _other != nullptr ? _other->identity : PeerIdentity();
+}
+
 std::string SimulatedConnectionEnd::description() const {
   if (_other == nullptr) return "service " + _serviceName;
   return fmt::format("pid {} ({})", _other->processIdentifier, _other->name);

@@ -31,6 +31,7 @@ class SimulatedConnectionEnd final : public std::enable_shared_from_this<Simulat
   void sendWithReply(ipc::Invocation invocation, ipc::ReplyBlock reply, ipc::Connection::ErrorHandler onError);
   void invalidate();
   bool peerHasEntitlement(const std::string& name) const;
+  PeerIdentity peerIdentity() const;
   std::string description() const;
   // The handle is gone: like invalidate(), but the handlers are not called.
   void letGo();

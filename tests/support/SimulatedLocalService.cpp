@@ -24,6 +24,8 @@ void SimulatedConnection::sendWithReply(ipc::Invocation invocation, ipc::ReplyBl
 
 void SimulatedConnection::invalidate() { _end->invalidate(); }
 
+PeerIdentity SimulatedConnection::peerIdentity() const { return _end->peerIdentity(); }
+
 bool SimulatedConnection::peerHasEntitlement(const std::string& name) const { return _end->peerHasEntitlement(name); }
 
 std::string SimulatedConnection::description() const { return _end->description(); }

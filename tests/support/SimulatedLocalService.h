@@ -22,6 +22,7 @@ class SimulatedConnection final : public ipc::Connection {
   void sendWithReply(ipc::Invocation invocation, ipc::ReplyBlock reply, ErrorHandler onError) override;
   void invalidate() override;
   bool peerHasEntitlement(const std::string& name) const override;
+  PeerIdentity peerIdentity() const override;
   std::string description() const override;
 
  private:

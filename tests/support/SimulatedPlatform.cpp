@@ -30,13 +30,30 @@ SimulatedPlatform::SimulatedPlatform(Surroundings surroundings, std::string name
       _random(seed),
       _faultyFiles(_storage->files),
       _submittableLogs(_faultyFiles),
+      _datagramSockets(_surroundings.datagrams, _dispatch),
+      _sandboxExtensions(_faultyFiles),
       _deviceAnswers(usualDevice()),
       _urlSessions(_surroundings.network.newProvider(name, _dispatch.process(), _faultyFiles, &_gate)),
       _localService(_surroundings.services.newService(_peer)),
-      _platform{
-          _surroundings.clock, _random,          _dispatch,     _log,          _faultyFiles,  _storage->userDefaults,
-          _deviceAnswers,      _locale,          _consent,      _clientBundle, *_urlSessions, _transactions,
-          *_localService,      _submittableLogs, _processMemory} {}
+      _platform{_surroundings.clock,
+                _random,
+                _dispatch,
+                _log,
+                _faultyFiles,
+                _storage->userDefaults,
+                _deviceAnswers,
+                _locale,
+                _consent,
+                _clientBundle,
+                *_urlSessions,
+                _transactions,
+                *_localService,
+                _submittableLogs,
+                _processMemory,
+                _datagramSockets,
+                _sandboxExtensions,
+                _wirelessDiagnostics,
+                _powerLog} {}
 
 SimulatedPlatform::~SimulatedPlatform() { kill(); }
 

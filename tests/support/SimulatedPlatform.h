@@ -14,13 +14,18 @@
 #include "tests/support/FixedDeviceAnswers.h"
 #include "tests/support/FixedLocale.h"
 #include "tests/support/FixedProcessMemory.h"
+#include "tests/support/MemoryExtensions.h"
 #include "tests/support/MemoryFileSystem.h"
 #include "tests/support/MemorySubmittableLogs.h"
 #include "tests/support/MemoryUserDefaults.h"
 #include "tests/support/RecordingLog.h"
+#include "tests/support/RecordingPowerLog.h"
 #include "tests/support/ScriptedNetwork.h"
+#include "tests/support/ScriptedWirelessDiagnostics.h"
 #include "tests/support/SeededRandom.h"
 #include "tests/support/SimulatedClock.h"
+#include "tests/support/SimulatedDatagramNetwork.h"
+#include "tests/support/SimulatedDatagramSockets.h"
 #include "tests/support/SimulatedDispatch.h"
 #include "tests/support/SimulatedServiceHub.h"
 
@@ -51,6 +56,7 @@ class SimulatedPlatform {
     SimulatedClock& clock;
     ScriptedNetwork& network;
     SimulatedServiceHub& services;
+    SimulatedDatagramNetwork& datagrams;
     RecordingLog::Observer logObserver;
   };
 
@@ -74,6 +80,10 @@ class SimulatedPlatform {
   std::shared_ptr<SimulatedStorage> storage() const noexcept { return _storage; }
   MemorySubmittableLogs& submittableLogs() noexcept { return _submittableLogs; }
   FixedProcessMemory& processMemory() noexcept { return _processMemory; }
+  SimulatedDatagramSockets& datagramSockets() noexcept { return _datagramSockets; }
+  MemoryExtensions& sandboxExtensions() noexcept { return _sandboxExtensions; }
+  ScriptedWirelessDiagnostics& wirelessDiagnostics() noexcept { return _wirelessDiagnostics; }
+  RecordingPowerLog& powerLog() noexcept { return _powerLog; }
   FixedDeviceAnswers& deviceAnswers() noexcept { return _deviceAnswers; }
   FixedLocale& locale() noexcept { return _locale; }
   FixedConsent& consent() noexcept { return _consent; }
@@ -101,6 +111,10 @@ class SimulatedPlatform {
   FaultyFileSystem _faultyFiles;
   MemorySubmittableLogs _submittableLogs;
   FixedProcessMemory _processMemory;
+  SimulatedDatagramSockets _datagramSockets;
+  MemoryExtensions _sandboxExtensions;
+  ScriptedWirelessDiagnostics _wirelessDiagnostics;
+  RecordingPowerLog _powerLog;
   FixedDeviceAnswers _deviceAnswers;
   FixedLocale _locale;
   FixedConsent _consent;

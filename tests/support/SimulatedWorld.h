@@ -8,6 +8,7 @@
 
 #include "tests/support/ScriptedNetwork.h"
 #include "tests/support/SimulatedClock.h"
+#include "tests/support/SimulatedDatagramNetwork.h"
 #include "tests/support/SimulatedPlatform.h"
 #include "tests/support/SimulatedScheduler.h"
 #include "tests/support/SimulatedServiceHub.h"
@@ -51,6 +52,7 @@ class SimulatedWorld {
   SimulatedClock& clock() noexcept { return _clock; }
   ScriptedNetwork& network() noexcept { return _network; }
   SimulatedServiceHub& services() noexcept { return _services; }
+  SimulatedDatagramNetwork& datagrams() noexcept { return _datagrams; }
   // The log lines of all processes in the order in which they were written.
   const std::string& text() const noexcept { return _text; }
 
@@ -59,6 +61,7 @@ class SimulatedWorld {
   SimulatedClock _clock;
   ScriptedNetwork _network;
   SimulatedServiceHub _services;
+  SimulatedDatagramNetwork _datagrams;
   std::string _text;
   int _lastProcessIdentifier = 100;
   std::vector<std::unique_ptr<SimulatedPlatform>> _processes;

@@ -77,7 +77,11 @@ class MessageLogFileThreadsTest : public ::testing::Test {
                     base.transactions,
                     base.localService,
                     submittableLogs,
-                    base.processMemory};
+                    base.processMemory,
+                    base.datagramSockets,
+                    base.sandboxExtensions,
+                    base.wirelessDiagnostics,
+                    base.powerLog};
   }
   // The messages of all lines of all files of the folder, which must be whole; how often each came.
   std::map<std::string, int> messagesIn(const std::string& path) {
