@@ -83,6 +83,11 @@ void ScriptedWirelessDiagnostics::putClass(const std::string& path, const std::s
   _state->classesByBundle[path].insert_or_assign(className, std::move(selectors));
 }
 
+void ScriptedWirelessDiagnostics::removeBundle(const std::string& path) {
+  const std::lock_guard lock(_state->mutex);
+  _state->classesByBundle.erase(path);
+}
+
 std::vector<ScriptedWirelessDiagnostics::Message> ScriptedWirelessDiagnostics::messages() const {
   const std::lock_guard lock(_state->mutex);
   return _state->messages;

@@ -29,6 +29,8 @@ class ScriptedWirelessDiagnostics final : public WirelessDiagnostics {
   // Puts a class into the bundle, which is made if need be; its instances respond to these selectors.
   void putClass(const std::string& path, const std::string& className,
                 std::set<std::string> selectors = {"sendMessageWithMethod:respCode:dict:"});
+  // Takes the bundle away; those that were opened before stay.
+  void removeBundle(const std::string& path);
 
   std::vector<Message> messages() const;
   // The paths asked for, each time.

@@ -1,0 +1,39 @@
+// An adaptor whose author did not think of exceptions: every function throws, the first ones only when asked for
+// something of their own.
+#include <cstring>
+#include <stdexcept>
+
+#include "platform/include/telvane/VDRAdaptor.h"
+
+namespace {
+
+struct OwnKind {};
+
+int theInstance = 0;
+
+}  // namespace
+
+uint32_t TelvaneVDRAdaptorGetVersion(void) {
+#ifdef THROWS_AT_ONCE
+  throw std::runtime_error("no version today");
+#else
+  return TELVANE_VDR_ADAPTOR_VERSION;
+#endif
+}
+
+TelvaneVDRAdaptorRef TelvaneVDRAdaptorCreate(const char* className) {
+  if (std::strcmp(className, "Impossible") == 0) throw std::runtime_error("cannot be made");
+  return reinterpret_cast<TelvaneVDRAdaptorRef>(&theInstance);
+}
+
+bool TelvaneVDRAdaptorRespondsToSelector(TelvaneVDRAdaptorRef, const char* selector) {
+  if (std::strcmp(selector, "unknown") == 0) throw OwnKind();
+  return true;
+}
+
+void TelvaneVDRAdaptorSendMessage(TelvaneVDRAdaptorRef, uint16_t method, uint16_t, plist_t) {
+  if (method == 1) throw OwnKind();
+  throw std::runtime_error("no service");
+}
+
+void TelvaneVDRAdaptorRelease(TelvaneVDRAdaptorRef) { throw std::logic_error("released too often"); }
