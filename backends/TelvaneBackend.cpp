@@ -3,7 +3,9 @@
 #include <algorithm>
 #include <array>
 
+#include "backends/DashboardBackend.h"
 #include "backends/HTTPSPostBackend.h"
+#include "backends/UploadBackend.h"
 #include "backends/VDRBackend.h"
 #include "backends/WattbookBackend.h"
 #include "interfaces/BackendKind.h"
@@ -51,8 +53,10 @@ std::shared_ptr<TelvaneBackend> TelvaneBackend::newBackendWithName(const Process
       return WattbookBackend::initWithName(context, name, profile, productFamily);
     case BackendKind::VDR:
       return VDRBackend::initWithName(context, name, profile, productFamily, clientType);
-    case BackendKind::Dashboard:
     case BackendKind::UploadServer:
+      return UploadBackend::initWithName(context, name, profile, productFamily);
+    case BackendKind::Dashboard:
+      return DashboardBackend::initWithName(context, name, profile, productFamily);
     case BackendKind::Unknown:
       break;  // not built yet, or no backend at all
   }

@@ -119,10 +119,12 @@ ClientSession::ClientSession(ClientContext& context, std::shared_ptr<ipc::Connec
                              std::shared_ptr<SerialQueue> reportingQueue, LetGoFlag isLetGo)
     : _context(context),
       _connection(std::move(connection)),
-      _reportingQueue(std::make_shared<ReportingQueue>(std::move(reportingQueue), context.log())),
+      _reportingQueue(std::make_shared<ReportingQueue>(reportingQueue, context.log())),
       _reportingPeriodicTasksQueue(context.platform().dispatch.newConcurrentQueue("com.corvex.Telvane.PeriodicTask",
                                                                                   QualityOfService::UserInitiated)),
-      _isLetGo(std::move(isLetGo)) {}
+      _isLetGo(std::move(isLetGo)),
+      _periodicTasks(context, {_reportingQueue, std::move(reportingQueue), _reportingPeriodicTasksQueue},
+                     [this](const Dictionary& message) { sendMessageWithDictionary(message, nullptr); }) {}
 
 ClientSession::~ClientSession() {
   try {
@@ -362,8 +364,8 @@ bool ClientSession::uploadFileWithURL(const String& fileURL, Telvane::UploadBloc
                 extension.error().code());
     return false;
   }
-  auto step = [self = shared_from_this(), url = String(fileURLOfPath(path)), extension = std::move(*extension),
-               completion = std::move(completionHandler)]() mutable {
+  auto step = [self = shared_from_this(), url = String(fileURLOfPath(canonicalPathOfFile(path))),
+               extension = std::move(*extension), completion = std::move(completionHandler)]() mutable {
     self->proxy("uploadFileWithURL")
         .uploadFileAtPath(url, {.descriptor = extension.release()},
                           [self, completion = std::move(completion)](bool isSuccess) mutable {

@@ -132,6 +132,8 @@ void ReportingSessionConnectivityHelper::postOnStateQueue(URLRequest request, Re
 
 std::optional<Result<std::shared_ptr<URLSessionTask>>> ReportingSessionConnectivityHelper::newBackgroundUpload(
     URLRequest request) {
+  // A body that is a file already needs no other one.
+  if (request.bodyFile != nullptr) return _privateURLSession->newDataTask(std::move(request));
   const std::string container = composeUniqueContainerURL();
   if (!_context.platform().files.write(container, request.body).has_value()) return std::nullopt;
   request.body = Data();

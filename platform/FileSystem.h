@@ -10,6 +10,7 @@
 #include "foundation/Date.h"
 #include "foundation/Error.h"
 #include "platform/AppendableFile.h"
+#include "platform/TemporaryFile.h"
 
 namespace telvane {
 
@@ -29,6 +30,9 @@ class FileSystem {
   // Opens a regular file for adding at its end. Never makes one (ENOENT) and never opens what a symbolic link leads to
   // (ELOOP).
   virtual Result<std::unique_ptr<AppendableFile>> openForAppending(const std::string& path) = 0;
+  // Makes an empty file that has no name, on the disk that the folder is on; this user alone may read it. The folder is
+  // created when it is missing.
+  virtual Result<std::unique_ptr<TemporaryFile>> newTemporaryFile(const std::string& folder) = 0;
   // Creates the folder and those above it; fine when it exists.
   virtual Result<void> createDirectory(const std::string& path) = 0;
   virtual Result<void> remove(const std::string& path) = 0;

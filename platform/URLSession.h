@@ -11,6 +11,7 @@
 #include "foundation/Data.h"
 #include "foundation/Error.h"
 #include "foundation/UniqueFunction.h"
+#include "platform/BodyFile.h"
 #include "platform/Dispatch.h"
 
 namespace telvane {
@@ -27,6 +28,8 @@ struct URLRequest {
   std::string method = "GET";
   std::vector<Header> headers;
   Data body;
+  // The body when it is too large for memory; goes instead of the other, and does not count as waiting in memory.
+  std::shared_ptr<const BodyFile> bodyFile;
   CachePolicy cachePolicy = CachePolicy::UseProtocol;
   bool allowsCellularAccess = true;
   // The longest time from resume to completion, waiting for connectivity included; without one a task may wait up to

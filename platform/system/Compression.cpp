@@ -16,6 +16,7 @@ constexpr int kWindowBitsGzip = 31;
 constexpr int kWindowBitsEither = 47;
 constexpr int kMemoryLevel = 8;
 constexpr size_t kInflateStep = 64u << 10;
+constexpr size_t kDeflateStep = 64u << 10;
 
 using EndFunction = int (*)(z_streamp);
 
@@ -54,6 +55,12 @@ Error inflateError(int code, const std::string& message) {
   return platformError(code, "Cannot inflate: " + (message.empty() ? "the data is cut short" : message));
 }
 
+// Prepares a stream for deflating.
+int begin(Stream& stream, Framing framing) {
+  const int windowBits = framing == Framing::Gzip ? kWindowBitsGzip : kWindowBitsZlib;
+  return deflateInit2(stream.get(), Z_DEFAULT_COMPRESSION, Z_DEFLATED, windowBits, kMemoryLevel, Z_DEFAULT_STRATEGY);
+}
+
 }  // namespace
 
 boost::system::result<Data, Failure> deflate(Framing framing, std::string_view input) {
@@ -61,9 +68,7 @@ boost::system::result<Data, Failure> deflate(Framing framing, std::string_view i
   if (input.size() > std::numeric_limits<uInt>::max()) return Failure{Failure::Step::Initialise, Z_MEM_ERROR, ""};
   Stream stream(::deflateEnd);
   setInput(stream, input);
-  const int windowBits = framing == Framing::Gzip ? kWindowBitsGzip : kWindowBitsZlib;
-  int code =
-      deflateInit2(stream.get(), Z_DEFAULT_COMPRESSION, Z_DEFLATED, windowBits, kMemoryLevel, Z_DEFAULT_STRATEGY);
+  int code = begin(stream, framing);
   if (code != Z_OK) return failure(Failure::Step::Initialise, code, stream);
   std::vector<uint8_t> output(::deflateBound(stream.get(), input.size()));
   do {
@@ -73,6 +78,50 @@ boost::system::result<Data, Failure> deflate(Framing framing, std::string_view i
   if (code != Z_STREAM_END) return failure(Failure::Step::Deflate, code, stream);
   // The buffer is several times what was written, and the result may wait for the network.
   return Data::copyOf(std::span(output.data(), stream->total_out));
+}
+
+struct Deflater::State {
+  Stream stream{::deflateEnd};
+  std::vector<uint8_t> buffer = std::vector<uint8_t>(kDeflateStep);
+};
+
+Deflater::Deflater(std::unique_ptr<State> state) noexcept : _state(std::move(state)) {}
+Deflater::Deflater(Deflater&& other) noexcept = default;
+Deflater::~Deflater() = default;
+
+boost::system::result<Deflater, Failure> Deflater::make(Framing framing) {
+  auto state = std::make_unique<State>();
+  const int code = begin(state->stream, framing);
+  if (code != Z_OK) return failure(Failure::Step::Initialise, code, state->stream);
+  return Deflater(std::move(state));
+}
+
+boost::system::result<void, Failure> Deflater::add(std::string_view piece, std::string& output) {
+  // zlib counts what it is given in an unsigned int.
+  constexpr size_t kMost = std::numeric_limits<uInt>::max();
+  for (; piece.size() > kMost; piece.remove_prefix(kMost)) {
+    const auto added = run(piece.substr(0, kMost), Z_NO_FLUSH, output);
+    if (added.has_error()) return added;
+  }
+  return run(piece, Z_NO_FLUSH, output);
+}
+
+boost::system::result<void, Failure> Deflater::finish(std::string& output) { return run({}, Z_FINISH, output); }
+
+boost::system::result<void, Failure> Deflater::run(std::string_view piece, int flush, std::string& output) {
+  Stream& stream = _state->stream;
+  setInput(stream, piece);
+  int code = Z_OK;
+  do {
+    setOutput(stream, _state->buffer, 0);
+    code = ::deflate(stream.get(), flush);
+    // Z_BUF_ERROR says that there was nothing to do.
+    if (code != Z_OK && code != Z_STREAM_END && code != Z_BUF_ERROR) {
+      return failure(Failure::Step::Deflate, code, stream);
+    }
+    output.append(reinterpret_cast<const char*>(_state->buffer.data()), kDeflateStep - stream->avail_out);
+  } while (stream->avail_out == 0);
+  return {};
 }
 
 Result<Data> inflate(std::string_view input, uint64_t maximumSize) {

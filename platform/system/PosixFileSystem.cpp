@@ -12,6 +12,7 @@
 #include "platform/system/FileAccess.h"
 #include "platform/system/FileTimes.h"
 #include "platform/system/PlatformError.h"
+#include "platform/system/UnnamedFile.h"
 
 namespace telvane {
 namespace {
@@ -42,6 +43,14 @@ Result<std::unique_ptr<AppendableFile>> PosixFileSystem::openForAppending(const 
   Result<std::unique_ptr<AppendFile>> file = AppendFile::openExisting(resolve(path));
   if (!file) return file.error();
   return std::unique_ptr<AppendableFile>(std::move(*file));
+}
+
+Result<std::unique_ptr<TemporaryFile>> PosixFileSystem::newTemporaryFile(const std::string& folder) {
+  const Result<void> made = createDirectory(folder);
+  if (!made) return made.error();
+  Result<std::unique_ptr<UnnamedFile>> file = UnnamedFile::open(resolve(folder));
+  if (!file) return file.error();
+  return std::unique_ptr<TemporaryFile>(std::move(*file));
 }
 
 Result<void> PosixFileSystem::createDirectory(const std::string& path) {

@@ -16,6 +16,7 @@ class PosixFileSystem final : public FileSystem {
   Result<void> writeAtomically(const std::string& path, const Data& data) override;
   Result<void> write(const std::string& path, const Data& data) override;
   Result<std::unique_ptr<AppendableFile>> openForAppending(const std::string& path) override;
+  Result<std::unique_ptr<TemporaryFile>> newTemporaryFile(const std::string& folder) override;
   Result<void> createDirectory(const std::string& path) override;
   // Removes a file or an empty folder. One that is not there is an error (ENOENT).
   Result<void> remove(const std::string& path) override;

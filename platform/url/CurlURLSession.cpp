@@ -3,6 +3,8 @@
 #include <algorithm>
 #include <utility>
 
+#include "platform/url/UploadFile.h"
+
 namespace telvane {
 
 namespace {
@@ -30,21 +32,17 @@ CurlURLSession::CurlURLSession(std::shared_ptr<const CurlEnvironment> environmen
       _delegate(std::move(delegate)) {}
 
 Result<std::shared_ptr<URLSessionTask>> CurlURLSession::newDataTask(URLRequest request) {
-  return newTask(std::move(request), nullptr);
+  if (!isActive()) return invalidatedError();
+  if (const Result<void> usable = CurlTransfer::check(request); !usable) return usable.error();
+  if (request.bodyFile != nullptr) request.body = Data();
+  return std::shared_ptr<URLSessionTask>(std::make_shared<CurlURLSessionTask>(shared_from_this(), std::move(request)));
 }
 
 Result<std::shared_ptr<URLSessionTask>> CurlURLSession::newUploadTask(URLRequest request, const std::string& path) {
   Result<std::unique_ptr<UploadFile>> file = UploadFile::open(path);
   if (!file) return file.error();
-  request.body = Data();
-  return newTask(std::move(request), std::move(*file));
-}
-
-Result<std::shared_ptr<URLSessionTask>> CurlURLSession::newTask(URLRequest request, std::unique_ptr<UploadFile> file) {
-  if (!isActive()) return invalidatedError();
-  if (const Result<void> usable = CurlTransfer::check(request); !usable) return usable.error();
-  return std::shared_ptr<URLSessionTask>(
-      std::make_shared<CurlURLSessionTask>(shared_from_this(), std::move(request), std::move(file)));
+  request.bodyFile = std::move(*file);
+  return newDataTask(std::move(request));
 }
 
 bool CurlURLSession::isActive() const {

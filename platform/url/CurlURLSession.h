@@ -61,7 +61,6 @@ class CurlURLSession final : public URLSession,
     std::unique_ptr<Timer> retryTimer;
   };
 
-  Result<std::shared_ptr<URLSessionTask>> newTask(URLRequest request, std::unique_ptr<UploadFile> file);
   bool isActive() const EXCLUDES(_mutex);
 
   // On the loop's thread, down to flush.

@@ -15,21 +15,14 @@ uint64_t bytesOf(const URLRequest& request) {
 
 }  // namespace
 
-CurlURLSessionTask::CurlURLSessionTask(std::shared_ptr<CurlURLSession> session, URLRequest request,
-                                       std::unique_ptr<UploadFile> file)
-    : _session(std::move(session)),
-      _heldBytes(bytesOf(request) + (file ? 0 : request.body.size())),
-      _request(std::move(request)),
-      _file(std::move(file)) {}
+CurlURLSessionTask::CurlURLSessionTask(std::shared_ptr<CurlURLSession> session, URLRequest request)
+    : _session(std::move(session)), _heldBytes(bytesOf(request) + request.body.size()), _request(std::move(request)) {}
 
 void CurlURLSessionTask::resume() {
   // Relaxed: only one caller goes on, and what it goes on with is handed over under the session's lock.
   if (!_isResumed.exchange(true, std::memory_order_relaxed)) _session->resume(shared_from_this());
 }
 
-void CurlURLSessionTask::releaseRequest() {
-  _request = URLRequest();
-  _file = nullptr;
-}
+void CurlURLSessionTask::releaseRequest() { _request = URLRequest(); }
 
 }  // namespace telvane

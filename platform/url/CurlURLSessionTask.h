@@ -6,7 +6,6 @@
 #include <string>
 
 #include "platform/URLSession.h"
-#include "platform/url/UploadFile.h"
 
 namespace telvane {
 
@@ -18,8 +17,7 @@ class CurlURLSession;
 // The description is to be set before resume. The response belongs to the delegate queue.
 class CurlURLSessionTask final : public URLSessionTask, public std::enable_shared_from_this<CurlURLSessionTask> {
  public:
-  // file: the body instead of the request's, or null.
-  CurlURLSessionTask(std::shared_ptr<CurlURLSession> session, URLRequest request, std::unique_ptr<UploadFile> file);
+  CurlURLSessionTask(std::shared_ptr<CurlURLSession> session, URLRequest request);
 
   // Starts the task; a second call does nothing.
   void resume() override;
@@ -30,9 +28,10 @@ class CurlURLSessionTask final : public URLSessionTask, public std::enable_share
   // For the session alone, from here on.
 
   const URLRequest& request() const noexcept { return _request; }
-  const UploadFile* file() const noexcept { return _file.get(); }
+  // The file that is sent, or null when the body is in memory.
+  const BodyFile* file() const noexcept { return _request.bodyFile.get(); }
   // The size of what is sent, wherever it comes from.
-  uint64_t bodySize() const noexcept { return _file ? _file->size() : _request.body.size(); }
+  uint64_t bodySize() const noexcept { return file() != nullptr ? file()->size() : _request.body.size(); }
   // The bytes of URL, headers and body that are held in memory; constant, also when the request has gone. Headers
   // count like the body: clients' names stand in them, at any length.
   uint64_t heldBytes() const noexcept { return _heldBytes; }
@@ -52,7 +51,6 @@ class CurlURLSessionTask final : public URLSessionTask, public std::enable_share
   std::string _description;
   // Read by the loop's thread after resume.
   URLRequest _request;
-  std::unique_ptr<UploadFile> _file;
   // Confined to the delegate queue.
   std::optional<URLResponse> _response;
   bool _isRefused = false;  // the delegate wants no more of it
