@@ -42,6 +42,9 @@ inline constexpr Key kEventReportVersion{"ReportVers"};
 inline constexpr Key kEventLocale{"Locale"};
 inline constexpr Key kEventAutomaticTimeSet{"AutomaticTimeSet"};
 
+// The event that tells a dashboard where uploaded log data lie.
+inline constexpr Key kEventLogDataUploadLocation{"LogDataUploadLocation"};
+
 // The posted body.
 inline constexpr Key kBodyPostTime{"postTime"};
 inline constexpr Key kBodyClientId{"clientId"};

@@ -20,8 +20,8 @@ class DatagramServer {
   static constexpr size_t kLongestDatagram = 65535;  // bytes; more do not come over IPv4
 
   // Called on the server's thread for each datagram, one at a time. The bytes are borrowed for the length of the call.
-  using Handler = UniqueFunction<void(DatagramServer& server, std::span<const uint8_t> datagram,
-                                      const IPv4SocketAddress& peer)>;
+  using Handler =
+      UniqueFunction<void(DatagramServer& server, std::span<const uint8_t> datagram, const IPv4SocketAddress& peer)>;
 
   // Opens the socket and starts to serve. Port 0 picks a free one.
   static Result<std::unique_ptr<DatagramServer>> start(const IPv4SocketAddress& address, Handler handler);

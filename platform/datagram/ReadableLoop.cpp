@@ -35,10 +35,9 @@ class ReadableLoop::Watch : public std::enable_shared_from_this<ReadableLoop::Wa
         _onReadable(std::move(onReadable)),
         _onCancel(std::move(onCancel)) {}
 
-  bool start() {
-    _number = _loop->add(shared_from_this(), _descriptor);
-    return _number != 0;
-  }
+  int descriptor() const noexcept { return _descriptor; }
+  // Before the loop looks at the descriptor.
+  void setNumber(uint64_t number) noexcept { _number = number; }
   // On the loop's thread, not again before fire has run.
   void tell() {
     _queue->async([watch = shared_from_this()] { watch->fire(); });
@@ -69,7 +68,7 @@ class ReadableLoop::Watch : public std::enable_shared_from_this<ReadableLoop::Wa
   const std::shared_ptr<ReadableLoop> _loop;
   const int _descriptor;
   const std::shared_ptr<SerialQueue> _queue;
-  uint64_t _number = 0;  // constant once started
+  uint64_t _number = 0;  // constant once it is looked at
   UniqueFunction<void()> _onReadable GUARDED_BY(*_queue);
   Job _onCancel GUARDED_BY(*_queue);
   std::atomic<bool> _isCancelled{false};
@@ -93,19 +92,20 @@ std::unique_ptr<ReadSource> ReadableLoop::newSource(int descriptor, std::shared_
                                                     UniqueFunction<void()> onReadable, Job onCancel) {
   auto watch = std::make_shared<Watch>(shared_from_this(), descriptor, std::move(queue), std::move(onReadable),
                                        std::move(onCancel));
-  if (!watch->start()) return nullptr;
+  if (!add(watch)) return nullptr;
   return std::make_unique<Source>(std::move(watch));
 }
 
-uint64_t ReadableLoop::add(const std::shared_ptr<Watch>& watch, int descriptor) {
+bool ReadableLoop::add(const std::shared_ptr<Watch>& watch) {
   MutexLock lock(_mutex);
-  if (_isStopped || !startThread()) return 0;
+  if (_isStopped || !startThread()) return false;
   const uint64_t number = ++_lastNumber;
+  watch->setNumber(number);
   _watches.emplace(number, watch);
   epoll_event event = readableOnce(number);
-  if (epoll_ctl(_epoll.get(), EPOLL_CTL_ADD, descriptor, &event) == 0) return number;
+  if (epoll_ctl(_epoll.get(), EPOLL_CTL_ADD, watch->descriptor(), &event) == 0) return true;
   _watches.erase(number);
-  return 0;
+  return false;
 }
 
 bool ReadableLoop::startThread() {

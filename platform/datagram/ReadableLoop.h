@@ -37,8 +37,8 @@ class ReadableLoop : public std::enable_shared_from_this<ReadableLoop> {
   class Source;
 
   bool startThread() REQUIRES(_mutex);
-  // Returns the new watch's number, or 0.
-  uint64_t add(const std::shared_ptr<Watch>& watch, int descriptor) EXCLUDES(_mutex);
+  // Gives the watch its number and has its descriptor looked at; false when that cannot be.
+  bool add(const std::shared_ptr<Watch>& watch) EXCLUDES(_mutex);
   void remove(uint64_t number, int descriptor) EXCLUDES(_mutex);
   void lookAgain(uint64_t number, int descriptor) const;
   void run();

@@ -6,17 +6,17 @@
 
 namespace telvane::testing {
 
-// UDP sockets of one simulated process. Part of its SimulatedPlatform.
+// UDP sockets of one simulated process. Part of its SimulatedPlatform. A process that has ended hears of nothing.
 class SimulatedDatagramSockets final : public DatagramSockets {
  public:
-  // REQUIRES: both outlive this object.
+  // REQUIRES: both outlive this object and its sockets.
   SimulatedDatagramSockets(SimulatedDatagramNetwork& network, SimulatedDispatch& dispatch)
       : _network(network), _dispatch(dispatch) {}
   Result<std::unique_ptr<DatagramSocket>> newSocket() override;
 
  private:
-  [[maybe_unused]] SimulatedDatagramNetwork& _network;
-  [[maybe_unused]] SimulatedDispatch& _dispatch;
+  SimulatedDatagramNetwork& _network;
+  SimulatedDispatch& _dispatch;
 };
 
 }  // namespace telvane::testing
