@@ -5,6 +5,7 @@
 #include <utility>
 
 #include "client/ClientPlatform.h"
+#include "client/ModuleBlocks.h"
 #include "client/PendingWork.h"
 
 namespace telvane {
@@ -13,11 +14,12 @@ namespace telvane {
 // client runtime (or a test), outlives all sessions that it is handed to. Safe from any thread.
 class ClientContext {
  public:
-  explicit ClientContext(const ClientPlatform& platform) : _platform(platform) {}
+  explicit ClientContext(const ClientPlatform& platform) : _platform(platform), _moduleBlocks(platform.dispatch) {}
 
   const ClientPlatform& platform() const noexcept { return _platform; }
   Log& log() const noexcept { return _platform.log; }
   PendingWork& pendingWork() noexcept { return _pendingWork; }
+  ModuleBlocks& moduleBlocks() noexcept { return _moduleBlocks; }
 
   // Calls code of the host: not any more once the process ends, since what that code uses may be gone by then. What it
   // throws goes no further than the log. operation: the name of the operation that calls out.
@@ -40,6 +42,7 @@ class ClientContext {
  private:
   const ClientPlatform _platform;
   PendingWork _pendingWork;
+  ModuleBlocks _moduleBlocks;
   std::atomic<bool> _isEnding = false;
 };
 

@@ -7,6 +7,7 @@
 #include "client/CachedStates.h"
 #include "client/ClientContext.h"
 #include "client/ClientSessionProxy.h"
+#include "client/PeriodicTasks.h"
 #include "client/ReportingQueue.h"
 #include "client/SessionObservers.h"
 #include "client/TelvaneAggregationObject.h"
@@ -57,6 +58,15 @@ class ClientSession : public std::enable_shared_from_this<ClientSession> {
   void setMessageLoggingBlock(Telvane::LoggingBlock block);
   Telvane::LoggingBlock messageLoggingBlock() const { return _observers.loggingBlock(); }
 
+  bool registerPeriodicTaskForModule(uint32_t module, bool needToUpdate, bool needToReport,
+                                     Telvane::PeriodicTaskBlock serviceBlock);
+  bool unregisterPeriodTaskForModule(uint32_t module);
+  void startLogTimerWithInterval(uint32_t interval, uint32_t reportingMultiplier, uint16_t category, uint16_t type);
+  void stopLogTimer();
+  // Ends the periodic tasks, behind what was called before, because the client has let its session go: they would go
+  // on for as long as answers to their own reports keep the session.
+  void endPeriodicTasks();
+
   // Lets the hold go when all that was sent before has been delivered, or can no longer be.
   void holdUntilDelivered(PendingWork::Hold hold);
 
@@ -87,9 +97,13 @@ class ClientSession : public std::enable_shared_from_this<ClientSession> {
   const LetGoFlag _isLetGo;
   std::weak_ptr<Telvane> _client;
 
+  // Confined to the steps of _reportingQueue.
+  PeriodicTasks _periodicTasks;
+
   // Synchronised by themselves.
   CachedStates _states;
   SessionObservers _observers;
+  std::atomic<bool> _hasPeriodicTasks = false;
 };
 
 }  // namespace telvane

@@ -41,6 +41,20 @@ class ReportingQueue : public std::enable_shared_from_this<ReportingQueue> {
   void perform(Step step) {
     if (!tryPerform(step)) async(std::move(step));
   }
+  // Runs the step before it returns, behind everything given before, and waits for that if it must.
+  // REQUIRES: as for tryPerform; !isCurrent().
+  template <class Step>
+  void sync(Dispatch& dispatch, Step& step) {
+    if (tryPerform(step)) return;
+    const std::shared_ptr<Semaphore> isDone = dispatch.newSemaphore(0);
+    async([&step, isDone] {
+      step();
+      isDone->signal();
+    });
+    isDone->wait();
+  }
+  // Whether the caller runs in a step that waited, and could not wait for another one.
+  bool isCurrent() const noexcept { return _queue->isCurrent(); }
   // Runs the step on the serial queue, behind everything given before.
   void async(Job step);
   // The same for a step that holds a message of about this many bytes. Drops it beyond the bound.

@@ -47,6 +47,7 @@ Telvane::Telvane() : _processGeneration(ClientRuntime::processGeneration()) {}
 
 Telvane::~Telvane() {
   if (session() != nullptr) {
+    guarded([this] { _session->endPeriodicTasks(); });
     guarded([this] { _session.reset(); });
     return;
   }
@@ -194,6 +195,34 @@ Telvane::LoggingBlock Telvane::messageLoggingBlock() const {
   const ClientSession* session = this->session();
   if (session == nullptr) return {};
   return guarded(LoggingBlock(), [&] { return session->messageLoggingBlock(); });
+}
+
+bool Telvane::registerPeriodicTaskForModule(uint32_t module, bool needToUpdate, bool needToReport,
+                                            PeriodicTaskBlock serviceBlock) {
+  ClientSession* session = this->session();
+  return session != nullptr && guarded(false, [&] {
+           return session->registerPeriodicTaskForModule(module, needToUpdate, needToReport, std::move(serviceBlock));
+         });
+}
+
+bool Telvane::unregisterPeriodTaskForModule(uint32_t module) {
+  if (ClientSession* session = this->session()) {
+    guarded([&] { session->unregisterPeriodTaskForModule(module); });
+  }
+  return true;
+}
+
+void Telvane::startLogTimerWithInterval(uint32_t interval, uint32_t reportingMultiplier, uint16_t category,
+                                        uint16_t type) {
+  if (ClientSession* session = this->session()) {
+    guarded([&] { session->startLogTimerWithInterval(interval, reportingMultiplier, category, type); });
+  }
+}
+
+void Telvane::stopLogTimer() {
+  if (ClientSession* session = this->session()) {
+    guarded([&] { session->stopLogTimer(); });
+  }
 }
 
 Value Telvane::getPersistentIdentifierForDNU(bool respectsDNU) {

@@ -1,6 +1,7 @@
 #include "client/include/telvane/TelvaneAPI.h"
 
 #include <memory>
+#include <stdexcept>
 #include <string>
 
 #include "client/include/telvane/Telvane.h"
@@ -72,6 +73,24 @@ Telvane::AggregationBlock blockOf(TelvaneAggregationCallback callback, void* con
   return [callback, context](const Value& client, double timestamp, uint16_t category, uint16_t type,
                              const Value& payload) {
     callback(ownedPlist(client).get(), timestamp, category, type, ownedPlist(payload).get(), context);
+  };
+}
+
+// What is thrown here goes to the log, and the report goes without it.
+Dictionary metricsOf(plist_t node) {
+  const telvane::Result<Value> metrics = valueOf(node);
+  if (!metrics) throw std::runtime_error(metrics.error().description());
+  return metrics->isDictionary() ? *metrics->dictionary() : Dictionary();
+}
+
+// Not of the same name as the others: a callback for backend names has the same type.
+Telvane::PeriodicTaskBlock periodicTaskBlockOf(TelvanePeriodicTaskCallback callback, void* context) {
+  if (callback == nullptr) return {};
+  return [callback, context](Dictionary* metrics) {
+    if (metrics == nullptr) return callback(nullptr, context);
+    const OwnedPlist node = ownedPlist(*metrics);
+    callback(node.get(), context);
+    *metrics = metricsOf(node.get());
   };
 }
 
@@ -213,6 +232,29 @@ bool TelvaneUploadLogWithArray(TelvaneRef session, plist_t logData) {
     const telvane::Result<Value> data = valueOf(logData);
     return session->session->uploadDataArray(data && data->isArray() ? *data->array() : Array());
   });
+}
+
+bool TelvaneRegisterPeriodicTaskForModule(TelvaneRef session, uint32_t module, bool needToUpdate, bool needToReport,
+                                          TelvanePeriodicTaskCallback callback, void* context) {
+  if (session == nullptr) return false;
+  return guarded(false, [&] {
+    return session->session->registerPeriodicTaskForModule(module, needToUpdate, needToReport,
+                                                           periodicTaskBlockOf(callback, context));
+  });
+}
+
+bool TelvaneUnregisterPeriodTaskForModule(TelvaneRef session, uint32_t module) {
+  return session != nullptr && session->session->unregisterPeriodTaskForModule(module);
+}
+
+void TelvaneStartLogTimerWithInterval(TelvaneRef session, uint32_t interval, uint32_t reportingMultiplier,
+                                      uint16_t category, uint16_t type) {
+  if (session == nullptr) return;
+  session->session->startLogTimerWithInterval(interval, reportingMultiplier, category, type);
+}
+
+void TelvaneStopLogTimer(TelvaneRef session) {
+  if (session != nullptr) session->session->stopLogTimer();
 }
 
 void TelvaneErrorRelease(TelvaneErrorRef error) { delete error; }

@@ -1,6 +1,7 @@
 #include "platform/dispatch/RepeatingTimer.h"
 
 #include <algorithm>
+#include <cstdint>
 #include <utility>
 
 #include "platform/Mutex.h"
@@ -9,6 +10,11 @@ namespace telvane {
 namespace {
 
 constexpr std::chrono::nanoseconds kShortestInterval = std::chrono::milliseconds(1);
+
+// The time that much later; the last one there is, when that cannot be told.
+Clock::MonotonicTime later(Clock::MonotonicTime time, std::chrono::nanoseconds by) {
+  return by >= Clock::MonotonicTime::max() - time ? Clock::MonotonicTime::max() : time + by;
+}
 
 }  // namespace
 
@@ -24,12 +30,19 @@ struct RepeatingTimer::State : std::enable_shared_from_this<RepeatingTimer::Stat
         onFire(std::move(fire)),
         onCancel(std::move(cancelled)) {}
 
-  // Sets the single timer of the next firing.
-  void schedule(std::chrono::nanoseconds delay) EXCLUDES(mutex) {
+  // Sets the single timer of the next firing. Returns false when there is none to be had.
+  bool schedule(std::chrono::nanoseconds delay) EXCLUDES(mutex) {
+    uint64_t number = 0;
+    {
+      MutexLock lock(mutex);
+      number = ++scheduleCount;
+    }
     auto next = dispatch.newTimer(queue, delay, leeway, [state = shared_from_this()] { state->fire(); }, {});
+    if (next == nullptr) return false;
     MutexLock lock(mutex);
-    if (isCancelled) return;  // and the timer with it
-    timer.swap(next);
+    // The first one may have fired already, and the next be set: that one must stay. What is not kept goes here.
+    if (!isCancelled && number == scheduleCount) timer.swap(next);
+    return true;
   }
   // On the queue.
   void fire() EXCLUDES(mutex) {
@@ -49,9 +62,9 @@ struct RepeatingTimer::State : std::enable_shared_from_this<RepeatingTimer::Stat
   }
   std::chrono::nanoseconds timeToNext() {
     const Clock::MonotonicTime now = clock.monotonicNow();
-    due += interval;
+    due = later(due, interval);
     if (due < now) due += (now - due) / interval * interval;
-    if (due < now) due += interval;
+    if (due < now) due = later(due, interval);
     return due - now;
   }
   void cancel() EXCLUDES(mutex) {
@@ -80,6 +93,7 @@ struct RepeatingTimer::State : std::enable_shared_from_this<RepeatingTimer::Stat
 
   Mutex mutex;
   bool isCancelled GUARDED_BY(mutex) = false;
+  uint64_t scheduleCount GUARDED_BY(mutex) = 0;
   std::unique_ptr<Timer> timer GUARDED_BY(mutex);
 };
 
@@ -89,8 +103,8 @@ std::unique_ptr<RepeatingTimer> RepeatingTimer::start(Dispatch& dispatch, const 
                                                       std::chrono::nanoseconds leeway, Handler onFire, Job onCancel) {
   auto state = std::make_shared<State>(dispatch, clock, std::move(queue), interval, leeway, std::move(onFire),
                                        std::move(onCancel));
-  state->due = clock.monotonicNow() + delay;
-  state->schedule(delay);
+  state->due = later(clock.monotonicNow(), delay);
+  if (!state->schedule(delay)) return nullptr;
   return std::unique_ptr<RepeatingTimer>(new RepeatingTimer(std::move(state)));
 }
 

@@ -19,7 +19,8 @@ class RepeatingTimer {
   // Starts a timer that fires first after the delay and then every interval, each time up to leeway later.
   // onFire is called on the queue, never twice at once. onCancel, which may be empty, runs once on the queue when the
   // timer has been cancelled; onFire is not called any more behind it, nor after a cancel on the queue. An interval of
-  // less than a millisecond counts as one. REQUIRES: dispatch and clock outlive the timer.
+  // less than a millisecond counts as one. Returns null when the dispatch has no timer to give.
+  // REQUIRES: dispatch and clock outlive the timer and the queue's jobs.
   static std::unique_ptr<RepeatingTimer> start(Dispatch& dispatch, const Clock& clock,
                                                std::shared_ptr<SerialQueue> queue, std::chrono::nanoseconds delay,
                                                std::chrono::nanoseconds interval, std::chrono::nanoseconds leeway,

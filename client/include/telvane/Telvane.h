@@ -70,6 +70,9 @@ class TELVANE_EXPORT Telvane : public std::enable_shared_from_this<Telvane> {
   // timestamp 0, category 0, type 0 and nothing else says that a session below has ended.
   using AggregationBlock = std::function<void(const Value& client, double timestamp, uint16_t category, uint16_t type,
                                               const Value& payload)>;
+  // Asks a module of this process for its metrics, on a thread of the library: with an empty dictionary that it fills
+  // before it returns, or with null when it is only to update its state. See registerPeriodicTaskForModule.
+  using PeriodicTaskBlock = std::function<void(Dictionary* metrics)>;
 
   // Opens a session. sessionInfo: a dictionary with the client type under "ComponentType" (5 to 30) and more as the
   // key constants name; 0 under "EnableFlag" switches the session off. userInfo: a dictionary with "_clientName" or
@@ -142,6 +145,38 @@ class TELVANE_EXPORT Telvane : public std::enable_shared_from_this<Telvane> {
   void setMessageLoggingBlock(LoggingBlock block);
   // Returns the block, empty when there is none.
   LoggingBlock messageLoggingBlock() const;
+
+  // Periodic metrics. Modules of this process are registered with a block each; the log timer calls the blocks at each
+  // of its ticks, at most four at a time, to let them update their state or, every so many ticks, to gather what they
+  // report into one real-time event. docs/periodic-tasks.md shows how they play together.
+  //
+  // A tick waits for the blocks that it has called, and what was called of this session meanwhile waits for the tick.
+  // So a block should be quick, and must not wait for anything that this session brings (a completion, say); one that
+  // never returns holds up its session for ever. The other calls of a session do not wait, and a block may make them.
+  //
+  // Registers a module, behind what was called before, and instead of an earlier one of that number. needToUpdate: call
+  // it at ticks that are no report; needToReport: call it for reports. serviceBlock: must not hold the session but
+  // weakly. What a block throws is caught and written to the log, and the report goes without what it has filled in. It
+  // is not called twice at once, except for a timer whose interval is 0, which does not wait for its blocks.
+  // Returns false for an empty block, else true.
+  bool registerPeriodicTaskForModule(uint32_t module, bool needToUpdate, bool needToReport,
+                                     PeriodicTaskBlock serviceBlock);
+  // Takes a module away, behind what was called before, and waits until that is done, if need be for the end of a tick.
+  // Then its block does not run and is not called any more (with an interval of 0, one that was called may still run).
+  // Called inside a module's block, of whichever session, or inside the delegate, for which the wait could be one for
+  // itself, it returns at once, and the module goes when what was called before is done: when the tick is over.
+  // Returns true, whether there was such a module or not.
+  bool unregisterPeriodTaskForModule(uint32_t module);
+  // Starts the log timer, which ticks at once and then every interval, in seconds (0 is a millisecond, and of no use
+  // but in tests). A tick that is late for the next one takes its place. Every reportingMultiplier-th tick is a report,
+  // all others are updates: with 1 every one, with 0 none. A report in which a module has filled in something is sent
+  // as an event with that category and type, real-time, and is filtered like any other. Equal keys of several modules
+  // come together: entries of dictionaries in one dictionary, elements of arrays in one array, and of other values the
+  // last one stays. Does nothing while there is a timer.
+  void startLogTimerWithInterval(uint32_t interval, uint32_t reportingMultiplier, uint16_t category, uint16_t type);
+  // Stops the log timer, behind what was called before; no block is called behind it. A timer is to be stopped before
+  // the last pointer to its session is let go. One that is not ends then, too, with the tick that is under way.
+  void stopLogTimer();
 
   // Returns this user's identifier of this device, making and keeping one on first use: the one that respects the
   // user's wish not to be followed (true), or the other. Whatever is stored is returned; what this library stores is a
