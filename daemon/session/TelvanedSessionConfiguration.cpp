@@ -37,6 +37,8 @@ void TelvanedSession::setSessionInfo(Dictionary sessionInfo, Value userInfo, Val
   _sessionDelegate->updateCorrelatedSessions(*this);
   _frameworks = std::move(frameworksToCheck);
   updateUserInfo(std::move(userInfo));
+  // In the midst of a session's life its helper may be another one from here on.
+  activateHelperOfEnabledBackends();
   _hasAggregator = hasAggregationBlock;
 }
 

@@ -172,6 +172,28 @@ TEST_F(TelvanedAgentHelpersTest, userInfoThatIsSentAgainAndAgainLosesNoEvent) {
   }
 }
 
+// The pool may give the helper up between its release and the new request, and the new one has no URL session before
+// somebody activates it: everything posted until then was dropped without a word.
+TEST_F(TelvanedAgentHelpersTest, aSessionInfoThatIsSentAgainAndAgainLosesNoEvent) {
+  constexpr int kAttempts = 40;
+  constexpr int kTimesInARow = 4;
+  givenStorebag(StorebagBuilder().set(kStorebagReleaseTimeout, 1));
+  log().expectError("newBackendWithName): release_timeout");
+  world.scheduler().setInterleaving(SimulatedScheduler::Interleaving::AtCalls);
+  for (int i = 0; i < kAttempts; ++i) {
+    const auto client = startSession();
+    for (int times = 0; times < kTimesInARow; ++times) {
+      client->askInPassing(ClientSessionOperation::SetSessionInfo, {sessionInfo(), userInfo(), Value(), false});
+    }
+    client->send(7);
+    client->flush();
+    EXPECT_EQ(postedEvents(7, 1).size(), static_cast<size_t>(i) + 1);
+    client->close();
+    world.advance(1min);
+    ASSERT_EQ(process.transactions().open(), 0) << "attempt " << i;
+  }
+}
+
 // Two sessions that end together may have the pool told at once that nobody is left, and once more by the release
 // timer.
 TEST_F(TelvanedAgentHelpersTest, aHelperThatIsGoneDoesNotTakeItsSuccessorAlong) {
