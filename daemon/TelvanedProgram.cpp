@@ -4,6 +4,7 @@
 #include <iostream>
 
 #include "daemon/TelvanedService.h"
+#include "platform/system/Allocator.h"
 #include "platform/system/ServiceManager.h"
 #include "platform/system/SystemPlatform.h"
 
@@ -65,7 +66,8 @@ void exitIfFailed(const Result<void>& step) {
 void runTelvaned(const TelvanedOptions& options, TerminationSignals& signals) {
   // Never destroyed: the process ends while threads may still wait for something in them.
   Log& log = *newLog(options.logTarget, options.logLevel, "telvaned").release();
-  auto& system = *std::make_unique<SystemPlatform>(log).release();
+  // Static so that it counts as in use at the end, when only its parts are referred to.
+  static SystemPlatform& system = *std::make_unique<SystemPlatform>(log).release();
   const bool isActivated = servicemanager::wasActivated();
   Platform platform = system.platform();
   auto& service = *std::make_unique<TelvanedService>(platform).release();
@@ -77,7 +79,7 @@ void runTelvaned(const TelvanedOptions& options, TerminationSignals& signals) {
   end.wait();
   servicemanager::notifyStopping();
   log.flush();
-  std::_Exit(EXIT_SUCCESS);
+  std::_Exit(hasLeakedMemory() ? EXIT_FAILURE : EXIT_SUCCESS);
 }
 
 }  // namespace telvane

@@ -7,4 +7,8 @@ namespace telvane {
 // For programs, before their first thread; never for a library inside a host.
 void keepFreedMemoryForReuse();
 
+// For an entry point that ends without the program's usual end, at which a leak sanitizer looks for leaks: returns
+// whether there are any, which it has then named on standard error. False in a build without it.
+bool hasLeakedMemory();
+
 }  // namespace telvane

@@ -117,16 +117,24 @@ class WireServer::Line {
   bool _isReady = true;
 };
 
-WireServer::WireServer(const std::optional<Certificate>& certificate, Respond respond) : _respond(std::move(respond)) {
+WireServer::WireServer(const std::optional<Certificate>& certificate, Respond respond, uint16_t port)
+    : _respond(std::move(respond)) {
   if (certificate.has_value()) _tls = std::make_shared<TLS>(*certificate);
   _socket = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  // The connections of the server that was there before linger on its port.
+  const int isReused = 1;
+  setsockopt(_socket, SOL_SOCKET, SO_REUSEADDR, &isReused, sizeof isReused);
   sockaddr_in address{};
   address.sin_family = AF_INET;
+  address.sin_port = htons(port);
   address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
   socklen_t size = sizeof address;
   const bool isOpen = bind(_socket, asAddress(address), size) == 0 && listen(_socket, 64) == 0 &&
                       getsockname(_socket, asAddress(address), &size) == 0;
-  if (!isOpen) throw std::runtime_error("no port for a wire server");
+  if (!isOpen) {
+    close(_socket);
+    throw std::runtime_error("no port for a wire server");
+  }
   _port = ntohs(address.sin_port);
   _acceptor = std::thread([this] { acceptConnections(); });
 }

@@ -42,8 +42,8 @@ class WireServer {
   using Respond = std::function<Answer(const WireRequest&)>;
   using Certificate = TestCertificates::Server;
 
-  // certificate: nothing for a plain one.
-  WireServer(const std::optional<Certificate>& certificate, Respond respond);
+  // certificate: nothing for a plain one. port: 0 for any that is free; another one to come back where a server was.
+  WireServer(const std::optional<Certificate>& certificate, Respond respond, uint16_t port = 0);
   // Ends all connections and waits for their threads.
   ~WireServer();
   WireServer(const WireServer&) = delete;
@@ -52,6 +52,7 @@ class WireServer {
   // An answer with that status and body over a connection that is kept.
   static Answer answer(int status, std::string_view body = "{}");
 
+  uint16_t port() const noexcept { return _port; }
   std::string address() const { return "127.0.0.1:" + std::to_string(_port); }
   std::string url(std::string_view path) const;
   std::vector<WireRequest> requests() const;

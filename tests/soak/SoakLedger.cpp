@@ -14,15 +14,13 @@ int64_t SoakLedger::sendEvent(Session session, Road road) {
   return static_cast<int64_t>(_events.size()) - 1;
 }
 
-void SoakLedger::excuse(Session session, Reason reason) {
-  Family& own = _sessions[session].own;
-  if (!own.isExcused) own = {true, reason};
+void SoakLedger::note(Family& family, Reason reason) {
+  if (!family.isExcused || family.reason == Reason::CollectorAway) family = {true, reason};
 }
 
-void SoakLedger::excuseFamily(Session session, Reason reason) {
-  Family& family = _families[_sessions[session].family];
-  if (!family.isExcused) family = {true, reason};
-}
+void SoakLedger::excuse(Session session, Reason reason) { note(_sessions[session].own, reason); }
+
+void SoakLedger::excuseFamily(Session session, Reason reason) { note(_families[_sessions[session].family], reason); }
 
 void SoakLedger::arrive(int64_t number, Answer answer) {
   if (number < 0 || static_cast<size_t>(number) >= _events.size()) {
@@ -41,7 +39,9 @@ void SoakLedger::arrive(int64_t number, Answer answer) {
 const SoakLedger::Family& SoakLedger::excuseOf(const Event& event) const {
   const Client& client = _sessions[event.session];
   const auto family = _families.find(client.family);
-  return client.own.isExcused || family == _families.end() ? client.own : family->second;
+  if (family == _families.end()) return client.own;
+  const bool hasReason = client.own.isExcused && client.own.reason != Reason::CollectorAway;
+  return hasReason || !family->second.isExcused ? client.own : family->second;
 }
 
 std::vector<std::string> SoakLedger::faults(Missing missing) const {
@@ -71,6 +71,8 @@ const char* SoakLedger::name(Reason reason) {
       return "lost with a killed client";
     case Reason::DisabledByServer:
       return "dropped, backend disabled by the server";
+    case Reason::CollectorAway:
+      return "lost while the collector was away";
   }
   return "";
 }
@@ -87,7 +89,7 @@ const char* SoakLedger::name(Answer answer) {
   return "";
 }
 
-std::string SoakLedger::summary() const {
+std::map<std::string, size_t> SoakLedger::accounts() const {
   std::map<std::string, size_t> counts;
   for (const Event& event : _events) {
     if (event.arrivals > 0) {
@@ -98,8 +100,12 @@ std::string SoakLedger::summary() const {
       ++counts[excuseOf(event).isExcused ? name(excuseOf(event).reason) : "unaccounted for"];
     }
   }
+  return counts;
+}
+
+std::string SoakLedger::summary() const {
   std::string text = fmt::format("{} sessions, {} events", _sessions.size(), _events.size());
-  for (const auto& [what, count] : counts) text += fmt::format("; {} {}", count, what);
+  for (const auto& [what, count] : accounts()) text += fmt::format("; {} {}", count, what);
   return text;
 }
 

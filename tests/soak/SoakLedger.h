@@ -19,7 +19,7 @@ class SoakLedger {
   // What the collector did with a post that reached it.
   enum class Answer { Taken, ServerError, ConnectionBroken };
   // Why events of a session may be missing.
-  enum class Reason { Unconfigured, OneTooMany, Killed, DisabledByServer };
+  enum class Reason { Unconfigured, OneTooMany, Killed, DisabledByServer, CollectorAway };
   // Whether the daemon is to post it, or to drop it by the storebag's lists.
   enum class Road { Posted, Filtered };
 
@@ -32,6 +32,8 @@ class SoakLedger {
   // Returns the number that the event has to carry.
   int64_t sendEvent(Session session, Road road = Road::Posted);
   // From here on, and for what was sent before: what is missing is accounted to this, unless there was a reason before.
+  // That the collector was away is only a reason where there is no other: who was there at the time need not have lost
+  // anything by it.
   void excuse(Session session, Reason reason);
   void excuseFamily(Session session, Reason reason);
   // The collector was posted this event; a server error disables the session's family.
@@ -40,9 +42,12 @@ class SoakLedger {
   // One line per fault; empty when all is accounted for. missing: whether what has not come yet is to be a fault too.
   enum class Missing { MayStillCome, IsFault };
   std::vector<std::string> faults(Missing missing) const;
-  // How many there are of each kind, in one line.
+  // How many events there are of each kind: delivered, filtered, or lost and why.
+  std::map<std::string, size_t> accounts() const;
+  // The same in one line.
   std::string summary() const;
   size_t taken() const;
+  size_t sessions() const noexcept { return _sessions.size(); }
   size_t events() const noexcept { return _events.size(); }
 
  private:
@@ -62,6 +67,7 @@ class SoakLedger {
     Family own;
   };
 
+  static void note(Family& family, Reason reason);
   static const char* name(Reason reason);
   static const char* name(Answer answer);
   const Family& excuseOf(const Event& event) const;

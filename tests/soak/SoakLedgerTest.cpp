@@ -73,6 +73,28 @@ TEST_F(SoakLedgerTest, accountsWhatIsMissingToTheFirstReasonOfItsSession) {
   EXPECT_THAT(ledger.summary(), HasSubstr("1 lost with a killed client"));
 }
 
+TEST_F(SoakLedgerTest, accountsNothingToTheCollectorsAbsenceWhereThereIsAnotherReason) {
+  const auto killed = ledger.openSession("a");
+  const auto disabled = ledger.openSession("b");
+  const auto unlucky = ledger.openSession("c");
+  const auto late = ledger.openSession("d");
+  for (const auto session : {killed, disabled, unlucky}) {
+    ledger.sendEvent(session);
+    ledger.excuse(session, Reason::CollectorAway);
+  }
+  ledger.sendEvent(late);
+  ledger.excuse(killed, Reason::Killed);
+  ledger.excuse(killed, Reason::CollectorAway);
+  ledger.arrive(ledger.sendEvent(disabled), Answer::ServerError);
+  EXPECT_THAT(ledger.accounts(),
+              ::testing::UnorderedElementsAre(::testing::Pair("lost with a killed client", 1u),
+                                              ::testing::Pair("dropped, backend disabled by the server", 1u),
+                                              ::testing::Pair("refused by the server", 1u),
+                                              ::testing::Pair("lost while the collector was away", 1u),
+                                              ::testing::Pair("unaccounted for", 1u)));
+  EXPECT_THAT(ledger.faults(Missing::IsFault), ElementsAre(HasSubstr("session 3")));
+}
+
 TEST_F(SoakLedgerTest, accountsWhatAWholeFamilyMissesToTheServersError) {
   const auto parent = ledger.openSession("a");
   const auto child = ledger.openSession("a");
