@@ -58,7 +58,7 @@ std::shared_ptr<TelvaneBackend> TelvaneBackend::newBackendWithName(const Process
     case BackendKind::Dashboard:
       return DashboardBackend::initWithName(context, name, profile, productFamily);
     case BackendKind::Unknown:
-      break;  // not built yet, or no backend at all
+      break;
   }
   context.log().error("TelvaneBackend(newBackendWithName): {}", name);
   return nullptr;

@@ -2,6 +2,7 @@
 
 #include <string_view>
 
+#include "interfaces/ClientTypes.h"
 #include "interfaces/SessionKeys.h"
 
 namespace telvane {
@@ -46,9 +47,7 @@ std::shared_ptr<VDRBackend> VDRBackend::initWithName(const ProcessContext& conte
 VDRBackend::VDRBackend(const ProcessContext& context, String name, Dictionary profile, String productFamily)
     : TelvaneBackend(context, std::move(name), std::move(profile), std::move(productFamily)) {}
 
-bool VDRBackend::isClientTypeAllowed(uint32_t clientType) noexcept {
-  return clientType == 7 || clientType == 11 || clientType == 13;
-}
+bool VDRBackend::isClientTypeAllowed(uint32_t clientType) noexcept { return hasWirelessDiagnostics(clientType); }
 
 void VDRBackend::loadAdaptor() {
   _clientBundle = _context.platform().wirelessDiagnostics.openBundleAtPath(kClientBundlePath);

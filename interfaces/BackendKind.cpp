@@ -15,8 +15,4 @@ BackendKind backendKindForName(std::string_view name) noexcept {
   return BackendKind::Unknown;
 }
 
-bool isBackendKindBuilt(BackendKind kind) noexcept {
-  return kind == BackendKind::HTTPSPost || kind == BackendKind::Dashboard;
-}
-
 }  // namespace telvane

@@ -12,7 +12,4 @@ enum class BackendKind : uint8_t { Dashboard, UploadServer, HTTPSPost, Wattbook,
 // kTelvaneBackendHTTPPost is an HTTPS backend. Whether one is made may depend on more (the VDR kind: on the device).
 BackendKind backendKindForName(std::string_view name) noexcept;
 
-// Whether the factory makes backends of this kind; the others are planned.
-bool isBackendKindBuilt(BackendKind kind) noexcept;
-
 }  // namespace telvane

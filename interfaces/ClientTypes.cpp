@@ -41,4 +41,6 @@ const ClientType* clientType(int32_t number) noexcept {
 
 const std::array<ClientType, kLastClientType - kFirstClientType + 1>& allClientTypes() noexcept { return kClientTypes; }
 
+bool hasWirelessDiagnostics(int64_t number) noexcept { return number == 7 || number == 11 || number == 13; }
+
 }  // namespace telvane

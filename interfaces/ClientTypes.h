@@ -23,6 +23,8 @@ inline constexpr std::string_view kConferencingStorebagName = "conferencing";
 
 // Returns the row of a client type, or null when there is no such type (below 5, above 30).
 const ClientType* clientType(int32_t number) noexcept;
+// Whether the system's wireless-diagnostics service takes events of the type: 7, 11 and 13.
+bool hasWirelessDiagnostics(int64_t number) noexcept;
 // All rows in ascending order of number.
 const std::array<ClientType, kLastClientType - kFirstClientType + 1>& allClientTypes() noexcept;
 

@@ -61,7 +61,7 @@ std::optional<std::string> addressAfter(const std::vector<GateStep>& steps, Gate
 
 BackendExplanation explainBackend(const ProcessContext& context, KeptLog& log, const DictionaryEntry& entry,
                                   const Dictionary& sessionInfo, const Value& userInfo) {
-  BackendExplanation explanation{.name = entry.key};
+  BackendExplanation explanation{.name = entry.key, .profile = entry.value};
   Dictionary alone;
   alone.set(entry.key, entry.value);
   const std::optional<BackendTable> made = createBackends(context, alone, sessionInfo, userInfo, String());
@@ -76,6 +76,7 @@ BackendExplanation explainBackend(const ProcessContext& context, KeptLog& log, c
     const bool isInternalBuild = context.isInternalBuild();
     explanation.postAddress = addressAfter(explanation.steps, Gate::PostURL, isInternalBuild);
     explanation.realtimePostAddress = addressAfter(explanation.steps, Gate::RealtimePostURL, isInternalBuild);
+    backend.cleanup();
   }
   explanation.logLines = log.take();
   return explanation;

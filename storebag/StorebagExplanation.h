@@ -22,6 +22,7 @@ struct GateStep {
 
 struct BackendExplanation {
   String name;
+  Value profile;        // with its macros expanded
   bool isMade = false;  // whether the factory makes a backend of the name and its profile; what follows is of one
   uint32_t state = 0;   // a TelvaneBackendState
   bool batchesEvents = false;

@@ -82,4 +82,9 @@ Result<FileContent> parseFile(const Data& bytes) {
   return FileContent{.bag = std::move(*sealed), .isSigned = true};
 }
 
+std::string_view bagNameOfFile(std::string_view path) noexcept {
+  const std::string_view name = path.substr(path.rfind('/') + 1);
+  return name.substr(0, name.find('.'));
+}
+
 }  // namespace telvane::storebagenvelope

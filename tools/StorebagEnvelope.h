@@ -1,5 +1,7 @@
 #pragma once
 
+#include <string_view>
+
 #include "foundation/Error.h"
 #include "foundation/Value.h"
 #include "platform/Crypto.h"
@@ -37,5 +39,9 @@ struct FileContent {
 // Reads whichever of the two the file is: an envelope when it is a property list with a text under "bag", otherwise a
 // bag as its author wrote it. Fails when it is neither.
 Result<FileContent> parseFile(const Data& bytes);
+
+// The name by which devices would ask for the bag of a file, as files are named by habit: "health" of
+// "bags/health.json". A view of the path.
+std::string_view bagNameOfFile(std::string_view path) noexcept;
 
 }  // namespace telvane::storebagenvelope

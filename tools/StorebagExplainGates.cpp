@@ -111,6 +111,39 @@ std::string enabledSentence(const BackendExplanation& backend) {
   return text;
 }
 
+// Devices bound the period between two looks at what is not acknowledged.
+std::string dashboardSentence(const Value& profile) {
+  const Dictionary& fields = *profile.dictionary();
+  const std::string address = fmt::format("{}:{}", shortText(fields[kProfileIP]), fields[kProfilePort].low16Bits());
+  const std::string sending = fmt::format("sent at once, one by one, as datagrams in clear to {}", address);
+  if (!fields.contains(kProfileReliable)) return sending + ", once each";
+  return sending + ", again until the dashboard acknowledges them";
+}
+
+std::string dashboardFault(const Value& profile) {
+  const Dictionary* const fields = profile.dictionary();
+  if (fields == nullptr) return "its profile is no dictionary";
+  if (!(*fields)[kProfileIP].isString()) return "its profile has no text \"ip\"";
+  if (!fields->contains(kProfilePort)) return "its profile has no \"port\"";
+  return fmt::format("{} is no IPv4 address", shortText((*fields)[kProfileIP]));
+}
+
+std::string uploadSentence(const Value& profile, bool hasConnection) {
+  const Value& postURL = (*profile.dictionary())[kProfilePostURL];
+  const std::string url = shortText(postURL);
+  // Nothing is made of an address without a scheme here.
+  const bool hasScheme = postURL.text().find("://") != std::string_view::npos;
+  const std::string fault = hasScheme ? addressFault(std::string(postURL.text())) : "does not begin with https://";
+  if (!fault.empty()) return fmt::format("not taken; files cannot be posted to {}, which {}", url, fault);
+  if (!hasConnection) return "not taken; a session without client name and service name cannot post files either";
+  return fmt::format("not taken; files that the client hands over are posted to {}", url);
+}
+
+std::string vdrFault(const StorebagExplainCase& situation) {
+  if (situation.hardware == kDesktopProductType) return "a desktop computer has no wireless diagnostics";
+  return fmt::format("sessions of the client type {} get none, only those of 7, 11 and 13", situation.clientType);
+}
+
 std::string expediteSentence(const GateStep& step) {
   const std::string_view words = batchingWords(step.answer.tested.booleanValue());
   if (isTaken(step)) return fmt::format("{}, so events {}", shortText(step.answer.against), words);
@@ -344,18 +377,42 @@ std::string eventsSentence(const BackendExplanation& backend, const StorebagExpl
     default:
       return "batched until the session has user info; a flush before that discards them";
   }
-  if (situation.clientName.empty() && situation.serviceName.empty()) {
-    return "lost: a session without client name and service name has no connection to post through";
+  const bool hasConnection = !situation.clientName.empty() || !situation.serviceName.empty();
+  switch (backendKindForName(backend.name)) {
+    case BackendKind::Dashboard:
+      return dashboardSentence(backend.profile);
+    case BackendKind::UploadServer:
+      return uploadSentence(backend.profile, hasConnection);
+    case BackendKind::Wattbook:
+      return "lost: what sessions send does not reach the power log";
+    case BackendKind::VDR:
+      return "handed to the device's wireless-diagnostics adaptor, as the client sent them; lost where there is none";
+    case BackendKind::HTTPSPost:
+    case BackendKind::Unknown:
+      break;
   }
-  return enabledSentence(backend);
+  return hasConnection ? enabledSentence(backend)
+                       : "lost: a session without client name and service name has no connection to post through";
 }
 
-std::string notMadeSentence(const BackendExplanation& backend, const StorebagExplainCase& situation) {
+std::string ungatedSentence(const BackendExplanation& backend, const StorebagExplainCase& situation) {
   const BackendKind kind = backendKindForName(backend.name);
-  if (kind == BackendKind::Unknown) return "no kind of backend has this name";
-  if (!isBackendKindBuilt(kind)) return "this build has no backend of this kind yet";
-  if (situation.productFamily.empty()) return "a device without product family gets none";
-  return "its profile has no list \"clients\" with an entry";
+  if (backend.isMade) return "this kind asks for nothing: it is enabled for every session, also without consent";
+  switch (kind) {
+    case BackendKind::HTTPSPost:
+      return situation.productFamily.empty() ? "a device without product family gets none"
+                                             : "its profile has no list \"clients\" with an entry";
+    case BackendKind::Dashboard:
+      return dashboardFault(backend.profile);
+    case BackendKind::UploadServer:
+      return "its profile has no text \"post_url\"";
+    case BackendKind::VDR:
+      return vdrFault(situation);
+    case BackendKind::Wattbook:
+    case BackendKind::Unknown:
+      break;
+  }
+  return "no kind of backend has this name";
 }
 
 const Value& settingAfter(const BackendExplanation& backend, Gate gate) noexcept {

@@ -133,10 +133,10 @@ Dictionary backendDictionary(const BackendExplanation& backend, const StorebagEx
   Dictionary fields{{kName, backend.name}, {kIsMade, backend.isMade}};
   if (const GateStep* step = decidingStep(backend)) {
     fields.set(kBecause, stepDictionary(*step));
-    addDecision(fields, backend, report);
   } else {
-    fields.set(kBecause, Dictionary{{kText, notMadeSentence(backend, report.situation)}});
+    fields.set(kBecause, Dictionary{{kText, ungatedSentence(backend, report.situation)}});
   }
+  if (backend.isMade) addDecision(fields, backend, report);
   fields.set(kLog, logArray(backend.logLines));
   return fields;
 }

@@ -6,7 +6,11 @@
 
 #include "interfaces/DefaultsKeys.h"
 #include "interfaces/StorebagKeys.h"
+#include "platform/DatagramSocket.h"
+#include "platform/PowerLog.h"
+#include "platform/WirelessDiagnostics.h"
 #include "platform/system/SystemPlatform.h"
+#include "tools/StillDispatch.h"
 
 namespace telvane {
 namespace {
@@ -103,6 +107,46 @@ class ChosenBundle final : public ClientBundle {
   const std::optional<String> _version;
 };
 
+// Sends nothing and hears nothing, as if all went well.
+class StillSocket final : public DatagramSocket {
+ public:
+  Result<void> bind() override { return {}; }
+  Result<void> connect(const IPv4SocketAddress&) override { return {}; }
+  Result<size_t> send(const uint8_t*, size_t length) override { return length; }
+  Result<size_t> receive(uint8_t*, size_t) override { return size_t{0}; }
+  std::unique_ptr<ReadSource> newReadSource(std::shared_ptr<SerialQueue> queue, UniqueFunction<void()>,
+                                            Job onCancel) override {
+    return std::make_unique<StillReadSource>(std::move(queue), std::move(onCancel));
+  }
+
+ private:
+  class StillReadSource final : public ReadSource {
+   public:
+    StillReadSource(std::shared_ptr<SerialQueue> queue, Job onCancel)
+        : _queue(std::move(queue)), _onCancel(std::move(onCancel)) {}
+    ~StillReadSource() override { StillReadSource::cancel(); }
+    void cancel() override {
+      const std::shared_ptr<SerialQueue> queue = std::move(_queue);
+      if (queue != nullptr && _onCancel) queue->async(std::move(_onCancel));
+    }
+
+   private:
+    std::shared_ptr<SerialQueue> _queue;  // null once cancelled
+    Job _onCancel;
+  };
+};
+
+class StillSockets final : public DatagramSockets {
+ public:
+  Result<std::unique_ptr<DatagramSocket>> newSocket() override { return {std::make_unique<StillSocket>()}; }
+};
+
+// What a device has there is not known, and is not loaded to be looked at.
+class UnopenedDiagnostics final : public WirelessDiagnostics {
+ public:
+  std::unique_ptr<WirelessDiagnosticsBundle> openBundleAtPath(const std::string&) override { return nullptr; }
+};
+
 // The section keys stand in the order of their numbers, from 1.
 Dictionary settingsOf(const StorebagExplainCase& situation) {
   constexpr std::string_view kEnvironments[] = {kEnvironmentDevelopment.view(), kEnvironmentInternal.view(),
@@ -125,12 +169,13 @@ struct StorebagExplainPlatform::Parts {
         locale(situation.country),
         consent(situation.hasConsent),
         bundle(situation.frameworkVersion),
+        dispatch(system.platform().dispatch),
         platform(withChosen(system.platform())) {}
 
   Platform withChosen(const Platform& real) {
     return {real.clock,
             random,
-            real.dispatch,
+            dispatch,
             log,
             real.files,
             defaults,
@@ -143,10 +188,10 @@ struct StorebagExplainPlatform::Parts {
             real.localService,
             real.submittableLogs,
             real.processMemory,
-            real.datagramSockets,
+            datagramSockets,
             real.sandboxExtensions,
-            real.wirelessDiagnostics,
-            real.powerLog};
+            wirelessDiagnostics,
+            powerLog};
   }
 
   const StorebagExplainCase situation;
@@ -158,6 +203,10 @@ struct StorebagExplainPlatform::Parts {
   ChosenLocale locale;
   ChosenConsent consent;
   ChosenBundle bundle;
+  StillDispatch dispatch;
+  StillSockets datagramSockets;
+  UnopenedDiagnostics wirelessDiagnostics;
+  NullPowerLog powerLog;
   Platform platform;
 };
 

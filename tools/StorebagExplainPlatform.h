@@ -9,7 +9,8 @@
 namespace telvane {
 
 // The device of a case as the Platform that the daemon's code asks: place, consent, settings, device, chance and client
-// bundle answer what the case says; everything else is this system's own. Settings are never written.
+// bundle answer what the case says; everything else is this system's own. Nothing is begun: no settings are written, no
+// socket is opened, no timer runs, no code of the device's is loaded.
 class StorebagExplainPlatform {
  public:
   explicit StorebagExplainPlatform(const StorebagExplainCase& situation);

@@ -6,6 +6,7 @@
 #include "foundation/Format.h"
 #include "interfaces/ClientTypes.h"
 #include "interfaces/StorebagKeys.h"
+#include "tools/StorebagEnvelope.h"
 #include "tools/StorebagExplainGates.h"
 
 namespace telvane {
@@ -114,10 +115,10 @@ std::string backendText(const BackendExplanation& backend, const StorebagExplain
       fmt::format("\n{}: {}\n", shortText(backend.name), backend.isMade ? stateName(backend.state) : "not made");
   if (const GateStep* step = decidingStep(backend)) {
     text += fmt::format("  because  {}: {}\n", gateName(step->answer.gate), gateSentence(*step));
-    text += fmt::format("  events   {}\n", eventsSentence(backend, report.situation));
   } else {
-    text += fmt::format("  because  {}\n", notMadeSentence(backend, report.situation));
+    text += fmt::format("  because  {}\n", ungatedSentence(backend, report.situation));
   }
+  if (backend.isMade) text += fmt::format("  events   {}\n", eventsSentence(backend, report.situation));
   for (const GateStep& step : backend.steps) {
     if (isWorthALine(step)) text += stepText(step);
   }
@@ -141,9 +142,7 @@ bool hangsOnAssumedDraw(const StorebagExplainReport& report) {
 
 // The client type whose bag has this file's name, when the session's type has another bag; null otherwise.
 const ClientType* otherTypeOfFile(const StorebagExplainReport& report) {
-  std::string_view stem = report.file;
-  if (const size_t slash = stem.rfind('/'); slash != std::string_view::npos) stem.remove_prefix(slash + 1);
-  stem = stem.substr(0, stem.find('.'));
+  const std::string_view stem = storebagenvelope::bagNameOfFile(report.file);
   if (stem == clientType(report.situation.clientType)->storebagName) return nullptr;
   const auto& types = allClientTypes();
   const auto found =

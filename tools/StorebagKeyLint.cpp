@@ -8,6 +8,7 @@
 #include <limits>
 
 #include "interfaces/StorebagKeys.h"
+#include "platform/IPv4SocketAddress.h"
 #include "tools/LintText.h"
 #include "tools/URLText.h"
 
@@ -27,6 +28,8 @@ constexpr double kSamplingSteps = 10000;
 constexpr double kRounding = 1e-6;  // what a decimal fraction may lack of its step
 constexpr int64_t kMostRefreshSeconds = 86400;
 constexpr int64_t kLastCategory = std::numeric_limits<uint16_t>::max();
+constexpr int64_t kShortestPeriod = 10;
+constexpr int64_t kLongestPeriod = 60000;
 constexpr size_t kVersionParts = 3;
 constexpr int kLastVersionPart = 255;
 
@@ -46,8 +49,8 @@ Range rangeOf(Shape shape) noexcept {
       return {std::numeric_limits<int32_t>::min(), kLastCategory};
     case Shape::Port:
       return {1, kLastCategory};
-    case Shape::Milliseconds:
-      return {1, std::numeric_limits<int32_t>::max()};
+    case Shape::Period:
+      return {kShortestPeriod, kLongestPeriod};
     case Shape::Consent:
       return {0, 1};
     default:
@@ -138,8 +141,11 @@ void StorebagKeyLint::lintValue(const std::string& path, const Row& row, const V
     case Shape::Version:
       return lintVersion(path, row, value);
     case Shape::PostURL:
+    case Shape::UploadURL:
     case Shape::DisplayURL:
       return lintURL(path, row, value);
+    case Shape::IPv4Address:
+      return lintIPv4Address(path, row, value);
     case Shape::FilterAction:
       return lintAction(path, row, value);
     case Shape::Switch:
@@ -149,7 +155,7 @@ void StorebagKeyLint::lintValue(const std::string& path, const Row& row, const V
     case Shape::EventThreshold:
     case Shape::EventNumber:
     case Shape::Port:
-    case Shape::Milliseconds:
+    case Shape::Period:
       return lintWholeNumber(path, row, value);
     case Shape::Share:
       return lintShare(path, row, value);
@@ -234,6 +240,12 @@ void StorebagKeyLint::lintURL(const std::string& path, const Row& row, const Val
     return;
   }
   const URLText& url = *parsed.url;
+  if (row.shape == Shape::UploadURL && row.presence == StorebagPresence::Required &&
+      value.text().find_first_of("?#") != std::string_view::npos) {
+    _report.error(path,
+                  fmt::format("{} has a query or fragment of its own, behind which devices add theirs; take it out",
+                              quoted(value.text())));
+  }
   if (url.isPlaceholder) {
     _report.warning(path, fmt::format("still has the mark {}; put HOST or HOST:PORT there before you sign", url.host));
   }
@@ -254,11 +266,22 @@ void StorebagKeyLint::lintURL(const std::string& path, const Row& row, const Val
 void StorebagKeyLint::lintPlainHTTP(const std::string& path, const Row& row) {
   if (row.shape == Shape::DisplayURL) {
     _report.warning(path, "is plain http, where anybody on the way can read and alter the page; use https");
+  } else if (row.shape == Shape::UploadURL) {
+    _report.warning(path, "is plain http: devices post unencrypted, for anybody on the way to read; use https");
   } else if (_audience == Audience::InternalBuilds) {
     _report.warning(path, "is plain http: internal builds send events unencrypted, all others to https; write https");
   } else {
     _report.error(path, "is plain http, and devices post to https on the same host and port; write https");
   }
+}
+
+// By the rule of the devices themselves.
+void StorebagKeyLint::lintIPv4Address(const std::string& path, const Row& row, const Value& value) {
+  if (!value.isString()) return reportKind(path, storebagShapeName(row.shape), value, row.absent);
+  if (isMacroReference(value) || ipv4SocketAddress(value.text(), 0).has_value()) return;
+  _report.error(path, fmt::format("{} is no dotted IPv4 address, and {}; write four numbers from 0 to 255 with points "
+                                  "between them, such as 192.0.2.1",
+                                  quoted(value.text()), row.absent));
 }
 
 void StorebagKeyLint::lintAction(const std::string& path, const Row& row, const Value& value) {
@@ -323,10 +346,22 @@ void StorebagKeyLint::lintWholeNumber(const std::string& path, const Row& row, c
   const bool isInRange =
       *number > static_cast<double>(range.least) - 1 && *number < static_cast<double>(range.most) + 1;
   if (isInRange) return lintRange(path, row, static_cast<int64_t>(*number));
-  const std::string consequence = row.shape == Shape::EventNumber ? "fits no event"
-                                  : row.shape == Shape::Consent
-                                      ? "means nothing and counts as 0"
-                                      : fmt::format("is out of range ({} to {})", range.least, range.most);
+  reportOutOfRange(path, row, value);
+}
+
+void StorebagKeyLint::reportOutOfRange(const std::string& path, const Row& row, const Value& value) {
+  const Range range = rangeOf(row.shape);
+  std::string consequence = fmt::format("is out of range ({} to {})", range.least, range.most);
+  if (row.shape == Shape::EventNumber) consequence = "fits no event";
+  if (row.shape == Shape::Consent) consequence = "means nothing and counts as 0";
+  if (row.shape == Shape::Port) {
+    consequence = fmt::format("has more than 16 bits, of which devices take the low ones: {}", value.low16Bits());
+    if (value.low16Bits() == 0) consequence = "is the port 0 for devices, which nobody listens on";
+  }
+  if (row.shape == Shape::Period) {
+    const int64_t period = value.integerValue();
+    consequence = period <= 0 ? "counts as 500" : fmt::format("counts as {}", period < kShortestPeriod ? 10 : 60000);
+  }
   _report.error(
       path, fmt::format("is {}, which {}; make it: {}", shortForm(value), consequence, storebagShapeName(row.shape)));
 }

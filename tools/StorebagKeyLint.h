@@ -39,11 +39,13 @@ class StorebagKeyLint {
   void lintVersion(const std::string& path, const Row& row, const Value& value);
   void lintURL(const std::string& path, const Row& row, const Value& value);
   void lintPlainHTTP(const std::string& path, const Row& row);
+  void lintIPv4Address(const std::string& path, const Row& row, const Value& value);
   void lintAction(const std::string& path, const Row& row, const Value& value);
   void lintPresence(const std::string& path, const Value& value);
 
   void lintWholeNumber(const std::string& path, const Row& row, const Value& value);
   void lintRange(const std::string& path, const Row& row, int64_t number);
+  void reportOutOfRange(const std::string& path, const Row& row, const Value& value);
   void lintShare(const std::string& path, const Row& row, const Value& value);
   // Returns the number that the value stands for, when it is finite; findings on its form are made on the way.
   // consequence: what devices do with what is no number.

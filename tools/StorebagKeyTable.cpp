@@ -145,23 +145,32 @@ constexpr StorebagKey kCountryThresholdKeys[] = {
 };
 
 constexpr StorebagKey kDashboardProfileKeys[] = {
-    {kProfileIP, Shape::Text, Required, "no backend is made", "The dashboard's IPv4 address.",
-     "Events are sent there as datagrams."},
-    {kProfilePort, Shape::Port, Required, "no datagram arrives", "The dashboard's UDP port.", "See `ip`."},
-    {kProfileReliable, Shape::Milliseconds, Optional, "unreliable datagrams",
-     "The time between two looks at what is not yet acknowledged, in milliseconds.",
-     "When it is there, datagrams are sent again until they are acknowledged."},
-    {kProfilePostURL, Shape::PostURL, Optional, "log data is refused", "Where log data is posted.",
-     "For clients that upload log data."},
+    {kProfileIP, Shape::IPv4Address, Required, "no backend is made",
+     "The dashboard's address; names are not looked up.",
+     "Every event is sent there as one UDP datagram, in clear, as the client sent it, and whatever the user says to "
+     "diagnostics."},
+    {kProfilePort, Shape::Port, Required, "no backend is made", "The dashboard's UDP port.",
+     "Of a number that is too large, the low 16 bits count."},
+    {kProfileReliable, Shape::Period, Optional, "each datagram is sent once",
+     "Send each datagram until the dashboard acknowledges it, and see to that every so many milliseconds.",
+     "One that is not acknowledged is sent again after 2, 5, 10 and 19 of these periods, and given up after 20; at "
+     "most "
+     "50 wait, then the oldest goes. 0 and less count as 500, less than 10 as 10, more than 60000 as 60000."},
+    {kProfilePostURL, Shape::UploadURL, Optional, "log data is refused, with an error line",
+     "Where log data is posted.",
+     "For clients that upload log data: the array goes there as one archive, and the answer, the data's location, goes "
+     "to the dashboard as an event."},
     {kProfileDisplayURL, Shape::DisplayURL, Optional, "none", "Where a person can look at what is reported.",
-     "Handed to a client that asks for it."},
+     "Handed to a client that asks for it. Nothing is sent there."},
 };
 
 constexpr StorebagKey kUploadProfileKeys[] = {
-    {kProfilePostURL, Shape::PostURL, Required, "no backend is made", "Where files are uploaded.",
-     "For clients that upload files."},
+    {kProfilePostURL, Shape::UploadURL, Required, "no backend is made", "Where files are uploaded.",
+     "A file that a client hands over is posted there, compressed, whatever the user says to diagnostics. What tells "
+     "of it is added as a query that begins with a question mark. An answer that contains `success` has the file "
+     "deleted on the device."},
     {kProfileDisplayURL, Shape::DisplayURL, Optional, "none", "Where a person can look at what is uploaded.",
-     "Handed to a client that asks for it."},
+     "Handed to a client that asks for it. Nothing is sent there."},
 };
 
 constexpr StorebagKey kPlainProfileKeys[] = {
@@ -249,6 +258,8 @@ std::string_view storebagShapeName(StorebagShape shape) noexcept {
       return "text, major.middle.minor";
     case Shape::PostURL:
       return "text, an https URL";
+    case Shape::UploadURL:
+      return "text, an http or https URL";
     case Shape::DisplayURL:
       return "text, a URL";
     case Shape::Switch:
@@ -262,10 +273,12 @@ std::string_view storebagShapeName(StorebagShape shape) noexcept {
       return "whole number";
     case Shape::EventNumber:
       return "whole number, 0 to 65535 or negative";
+    case Shape::IPv4Address:
+      return "text, an IPv4 address";
     case Shape::Port:
       return "whole number, 1 to 65535";
-    case Shape::Milliseconds:
-      return "whole number of milliseconds, above 0";
+    case Shape::Period:
+      return "whole number of milliseconds, 10 to 60000";
     case Shape::Share:
       return "number from 0 to 1";
     case Shape::FilterAction:

@@ -37,7 +37,8 @@ enum class StorebagShape : uint8_t {
   Base64,
   Names,              // separated by commas
   Version,            // major.middle.minor
-  PostURL,            // https
+  PostURL,            // https, or devices make it so
+  UploadURL,          // http or https; taken as it is
   DisplayURL,         // http or https
   Switch,             // 0 or 1
   Consent,            // 0 or 1, of which only exactly 1 counts
@@ -45,8 +46,9 @@ enum class StorebagShape : uint8_t {
   TimeoutSeconds,     // 32 bits, unsigned
   EventThreshold,     // 32 bits, signed
   EventNumber,        // 16 bits, unsigned; negative for any
+  IPv4Address,        // dotted
   Port,               // 1 to 65535
-  Milliseconds,       // above 0
+  Period,             // milliseconds, 10 to 60000
   Share,              // 0 to 1
   FilterAction,       // one of kFilterActions
   Texts,              // array

@@ -3,10 +3,11 @@
 #include <fmt/format.h>
 
 #include <array>
+#include <vector>
 
 #include "foundation/Base64.h"
-#include "interfaces/BackendKind.h"
 #include "interfaces/BackendNames.h"
+#include "interfaces/ClientTypes.h"
 #include "interfaces/StorebagKeys.h"
 #include "platform/PropertyList.h"
 #include "platform/log/NullLog.h"
@@ -63,12 +64,12 @@ std::optional<Data> decoded(const Value& text) {
 
 }  // namespace
 
-Result<LintReport> StorebagLint::lintFile(const Data& bytes) {
+Result<LintReport> StorebagLint::lintFile(const Data& bytes, std::string_view bagName) {
   const Result<Dictionary> written = storebagenvelope::parseBag(bytes);
   if (written.has_error()) return written.error();
   LintReport report;
   RepeatedKeys(report, bytes.view()).lint();
-  StorebagLint lint(report);
+  StorebagLint lint(report, bagName);
   if (written->contains(kEnvelopeBag) || written->contains(kEnvelopeSignature)) {
     lint.lintEnvelope(*written, propertylist::parse(bytes).has_value());
   } else {
@@ -77,9 +78,9 @@ Result<LintReport> StorebagLint::lintFile(const Data& bytes) {
   return report;
 }
 
-LintReport StorebagLint::lintBag(const Dictionary& bag) {
+LintReport StorebagLint::lintBag(const Dictionary& bag, std::string_view bagName) {
   LintReport report;
-  StorebagLint(report).lintInner(bag);
+  StorebagLint(report, bagName).lintInner(bag);
   return report;
 }
 
@@ -173,13 +174,39 @@ void StorebagLint::lintBackend(const std::string& path, std::string_view name, c
                                StorebagKeyLint& keys) {
   const BackendKind kind = backendKindForName(name);
   if (kind == BackendKind::Unknown) return lintName(path, name);
-  if (!isBackendKindBuilt(kind)) {
+  lintKind(path, kind);
+  if (profile.isDictionary()) return lintProfile(path, *profile.dictionary(), levelOf(kind), keys);
+  const bool isRead = levelOf(kind) != StorebagLevel::PlainProfile;
+  keys.reportKind(path, "a dictionary, a profile", profile,
+                  isRead ? "no backend is made" : "the backend is made all the same");
+}
+
+void StorebagLint::lintKind(const std::string& path, BackendKind kind) {
+  if (kind == BackendKind::Dashboard) {
     _report.warning(path,
-                    "is a backend that this version does not make yet: devices log its name and go on without it; "
-                    "take it out unless newer devices are meant");
+                    "gets every event, unfiltered and in clear, also of users who do not agree to diagnostics; take it "
+                    "out unless that is meant");
+  } else if (kind == BackendKind::Wattbook) {
+    _report.warning(path, "gets no event: what sessions send does not reach the power log; take it out");
+  } else if (kind == BackendKind::VDR) {
+    lintClientTypes(path);
   }
-  if (!profile.isDictionary()) return keys.reportKind(path, "a dictionary, a profile", profile, "no backend is made");
-  lintProfile(path, *profile.dictionary(), levelOf(kind), keys);
+}
+
+// A bag does not hold its own name; where that is not known there is nothing to say.
+void StorebagLint::lintClientTypes(const std::string& path) {
+  std::vector<int32_t> types;
+  bool isOfUse = false;
+  for (const ClientType& type : allClientTypes()) {
+    if (type.storebagName != _bagName) continue;
+    types.push_back(type.number);
+    isOfUse = isOfUse || hasWirelessDiagnostics(type.number);
+  }
+  if (types.empty() || isOfUse) return;
+  _report.warning(path,
+                  fmt::format("is made for the client types 7, 11 and 13 only, and the bag {} is read by {}: their "
+                              "sessions log an error and go without it; take it out",
+                              quoted(_bagName), fmt::join(types, ", ")));
 }
 
 void StorebagLint::lintName(const std::string& path, std::string_view name) {

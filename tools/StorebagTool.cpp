@@ -118,7 +118,7 @@ Result<void> StorebagTool::sign() {
 
 // A signed bag with mistakes may be meant, in a test; whom it surprises should hear of them before devices do.
 void StorebagTool::tellMistakes(const Data& bag) {
-  const Result<LintReport> report = StorebagLint::lintFile(bag);
+  const Result<LintReport> report = StorebagLint::lintFile(bag, storebagenvelope::bagNameOfFile(_inputFile));
   const size_t errors = report.has_value() ? report->count(LintFinding::Severity::Error) : 0;
   if (errors == 0) return;
   _errors << kName << ": signed, but lint finds " << counted(errors, "error") << " in " << _inputFile
@@ -160,7 +160,7 @@ Result<void> StorebagTool::lint() {
   constexpr char kAdvice[] = "; name a property list, JSON or a signed envelope";
   const Result<Data> bytes = readFile(_bagFile);
   if (bytes.has_error()) return fault(bytes.error().description() + kAdvice);
-  const Result<LintReport> report = StorebagLint::lintFile(*bytes);
+  const Result<LintReport> report = StorebagLint::lintFile(*bytes, storebagenvelope::bagNameOfFile(_bagFile));
   if (report.has_error()) return fault(_bagFile + ": " + report.error().description() + kAdvice);
   for (const LintFinding& finding : report->findings()) {
     const bool isError = finding.severity == LintFinding::Severity::Error;

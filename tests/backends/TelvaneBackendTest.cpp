@@ -57,11 +57,22 @@ TEST_F(TelvaneBackendTest, otherNamesMustBeEqual) {
   for (const char* name : {"gonzo2", "Splunk", "qrs ", "splun", ""}) EXPECT_EQ(named(name), nullptr) << name;
 }
 
-TEST_F(TelvaneBackendTest, kindsThatAreNotBuiltYetAreRefusedByName) {
-  for (const char* name : {"dashboard", "upload_server"}) {
-    log().expectError(std::string("TelvaneBackend(newBackendWithName): ") + name);
-    EXPECT_EQ(named(name), nullptr) << name;
+TEST_F(TelvaneBackendTest, theOtherKindsAreMadeOfWhatTheirProfilesNeed) {
+  _clientType = 7;
+  const std::pair<const char*, Dictionary> kinds[] = {
+      {"dashboard", {{kProfileIP, "192.0.2.1"}, {kProfilePort, 9000}}},
+      {"upload_server", {{kProfilePostURL, "https://collector.example/upload"}}},
+      {"power", {}},
+      {"vdr", {}}};
+  for (const auto& [name, needed] : kinds) {
+    const auto backend = TelvaneBackend::newBackendWithName(context(), name, needed, _productFamily, _clientType);
+    ASSERT_NE(backend, nullptr) << name;
+    EXPECT_EQ(backend->name(), name);
+    EXPECT_FALSE(backend->isHTTPSPostBackend()) << name;
+    EXPECT_EQ(backend->updateState(), TelvaneBackendStateEnabled) << name;
+    backend->cleanup();
   }
+  _world.runUntilIdle();
 }
 
 TEST_F(TelvaneBackendTest, aDesktopComputerHasNoWirelessDiagnostics) {

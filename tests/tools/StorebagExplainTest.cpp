@@ -3,6 +3,7 @@
 
 #include <gmock/gmock.h>
 
+#include <map>
 #include <sstream>
 
 #include "interfaces/BackendNames.h"
@@ -527,12 +528,75 @@ TEST_F(StorebagExplainTest, saysOfNamesThatMakeNoBackendWhy) {
     const Dictionary& backend = *backends[index].dictionary();
     return std::string((*backend["because"].dictionary())["text"].text());
   };
-  EXPECT_EQ(reason(0), "this build has no backend of this kind yet");
+  EXPECT_EQ(reason(0), "sessions of the client type 6 get none, only those of 7, 11 and 13");
   EXPECT_EQ(reason(1), "no kind of backend has this name");
   EXPECT_EQ(reason(2), "its profile has no list \"clients\" with an entry");
   EXPECT_EQ(text(*backends[3].dictionary(), "state"), "enabled");
   run({"explain", "@bag", "--product-family", ""});
   EXPECT_THAT(output(), HasSubstr("qrs: not made\n  because  a device without product family gets none\n"));
+}
+
+// Kinds that ask no gates; each is explained as the daemon would make it, but nothing is opened, sent or loaded.
+TEST_F(StorebagExplainTest, tellsWhatBecomesOfTheEventsOfBackendsWithoutGates) {
+  Dictionary section;
+  section.set("dashboard", Dictionary{{kProfileIP, "192.0.2.1"}, {kProfilePort, 9000}, {kProfileReliable, 500}});
+  section.set("upload_server", Dictionary{{kProfilePostURL, "https://a.example/upload"}});
+  section.set("power", Dictionary());
+  section.set("vdr", Dictionary{{kProfileActive, true}});
+  givenBag({{kEnvironmentRelease, section}});
+  const Dictionary explained = explain(0, {"--client-type", "7", "--consent", "off"});
+  std::map<std::string, std::string> events;
+  for (const Value& backend : *explained["backends"].array()) {
+    const Dictionary& fields = *backend.dictionary();
+    EXPECT_EQ(text(fields, "state"), "enabled") << text(fields, "name");
+    EXPECT_EQ(text(*fields["because"].dictionary(), "text"),
+              "this kind asks for nothing: it is enabled for every session, also without consent");
+    events[text(fields, "name")] = text(fields, "events");
+  }
+  EXPECT_EQ(events["dashboard"],
+            "sent at once, one by one, as datagrams in clear to 192.0.2.1:9000, again until the dashboard acknowledges "
+            "them");
+  EXPECT_EQ(events["upload_server"],
+            "not taken; files that the client hands over are posted to https://a.example/upload");
+  EXPECT_EQ(events["power"], "lost: what sessions send does not reach the power log");
+  EXPECT_THAT(events["vdr"], StartsWith("handed to the device's wireless-diagnostics adaptor"));
+  run({"explain", "@bag", "--client-type", "7", "--log"});
+  EXPECT_THAT(output(), HasSubstr("vdr: enabled\n  because  this kind asks for nothing"));
+  EXPECT_THAT(output(),
+              HasSubstr("  log      VDRBackend(initWithName): Loading VDR adaptor class for client type 7\n"));
+}
+
+TEST_F(StorebagExplainTest, saysWhyABackendWithoutGatesIsNotMade) {
+  const auto reason = [this](const char* name, Value profile, const Arguments& options = {}) {
+    Dictionary section;
+    section.set(name, std::move(profile));
+    givenBag({{kEnvironmentRelease, section}});
+    const Dictionary backend = only(explain(0, options));
+    EXPECT_EQ(backend["isMade"], Value(false)) << name;
+    EXPECT_FALSE(backend.contains("state")) << name;
+    return text(*backend["because"].dictionary(), "text");
+  };
+  EXPECT_EQ(reason("dashboard", 5), "its profile is no dictionary");
+  EXPECT_EQ(reason("dashboard", Dictionary{{kProfilePort, 1}}), "its profile has no text \"ip\"");
+  EXPECT_EQ(reason("dashboard", Dictionary{{kProfileIP, "192.0.2.1"}}), "its profile has no \"port\"");
+  EXPECT_EQ(reason("dashboard", Dictionary{{kProfileIP, "host"}, {kProfilePort, 1}}), "host is no IPv4 address");
+  EXPECT_EQ(reason("upload_server", Dictionary()), "its profile has no text \"post_url\"");
+  EXPECT_EQ(reason("vdr", Dictionary(), {"--client-type", "7", "--hardware", "Desktop"}),
+            "a desktop computer has no wireless diagnostics");
+}
+
+TEST_F(StorebagExplainTest, saysWhatKeepsFilesFromBeingPosted) {
+  const auto events = [this](const char* url, const Arguments& options = {}) {
+    Dictionary section;
+    section.set("upload_server", Dictionary{{kProfilePostURL, url}});
+    givenBag({{kEnvironmentRelease, section}});
+    return text(only(explain(0, options)), "events");
+  };
+  EXPECT_THAT(events("a.example/upload"), HasSubstr("which does not begin with https://"));
+  EXPECT_THAT(events("ftp://a.example/"), HasSubstr("which is neither https nor http"));
+  EXPECT_THAT(events("http://a.example/"), HasSubstr("are posted to http://a.example/"));
+  EXPECT_THAT(events("https://a.example/", {"--client-name", "", "--service-name", ""}),
+              HasSubstr("cannot post files either"));
 }
 
 TEST_F(StorebagExplainTest, readsPropertyListsJSONAndEnvelopes) {

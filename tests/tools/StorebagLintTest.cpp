@@ -333,14 +333,7 @@ TEST(StorebagLintTest, namesBackendsThatAreNone) {
   EXPECT_THAT(lintBackend("release_timeout", 60), ElementsAre(error("release/release_timeout", "top of the bag")));
   EXPECT_THAT(lintBackend("my-splunk-2", profile), IsEmpty());
   EXPECT_THAT(lintBackend("gonzo", 5), ElementsAre(error("release/gonzo", "is a number, and no backend is made")));
-  EXPECT_THAT(lintBackend("vdr", Dictionary{{kProfileActive, true}}),
-              ElementsAre(warning("release/vdr", "this version does not make yet")));
-  EXPECT_THAT(
-      lintBackend("dashboard", parsed(R"({"ip": "192.0.2.1", "port": 70000, "reliable": 250})")),
-      ElementsAre(warning("release/dashboard", "not make yet"), error("release/dashboard/port", "out of range")));
-  EXPECT_THAT(lintBackend("upload_server", Dictionary()),
-              ElementsAre(warning("release/upload_server", "not make yet"),
-                          error("release/upload_server/post_url", "is missing")));
+  EXPECT_THAT(lintBackend("vdr", Dictionary{{kProfileActive, true}}), IsEmpty());
 }
 
 TEST(StorebagLintTest, internalBuildsReallySendPlainHTTP) {
