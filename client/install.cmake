@@ -3,6 +3,9 @@ set(package_dir "${CMAKE_INSTALL_LIBDIR}/cmake/Telvane")
 install(TARGETS telvane EXPORT TelvaneTargets
   LIBRARY DESTINATION "${CMAKE_INSTALL_LIBDIR}" COMPONENT client)
 install(DIRECTORY include/telvane DESTINATION "${CMAKE_INSTALL_INCLUDEDIR}" COMPONENT client)
+# For the authors of adaptors; what it describes is called by the daemon.
+install(FILES "${PROJECT_SOURCE_DIR}/platform/include/telvane/VDRAdaptor.h"
+  DESTINATION "${CMAKE_INSTALL_INCLUDEDIR}/telvane" COMPONENT client)
 # What <telvane/Telvane.h> includes, and the descriptions of values.
 set(foundation_headers Base64 Data Date Description Error Export Key SharedCount String UniqueFunction UUID Value)
 list(TRANSFORM foundation_headers REPLACE "(.+)" "${PROJECT_SOURCE_DIR}/foundation/\\1.h")
