@@ -1,11 +1,16 @@
 #include "tools/DaemonCommands.h"
 
+#include <algorithm>
+
 #include "client/OneShotSender.h"
 #include "client/SessionInfoValidation.h"
+#include "interfaces/BackendNames.h"
 #include "interfaces/ClientSessionInterface.h"
+#include "interfaces/FileURL.h"
 #include "interfaces/SessionKeys.h"
 #include "platform/JSON.h"
 #include "platform/ProcessIdentifier.h"
+#include "platform/system/PosixFileSystem.h"
 #include "tools/Answer.h"
 #include "tools/StatusText.h"
 
@@ -14,6 +19,8 @@ namespace {
 
 // Longer than the daemon takes to give up on a storebag server.
 constexpr auto kPatience = std::chrono::seconds(60);
+// A large file takes its time, and the daemon none of its own.
+constexpr auto kUploadPatience = std::chrono::hours(24);
 constexpr auto kStatusPatience = std::chrono::seconds(10);
 
 Error fault(const std::string& text) { return Error::withDescription("TelvaneControl", 1, text); }
@@ -21,6 +28,12 @@ Error fault(const std::string& text) { return Error::withDescription("TelvaneCon
 bool hasName(const Value& userInfo) {
   const Dictionary* info = userInfo.dictionary();
   return info != nullptr && (info->contains(kTelvaneUserInfoClientName) || info->contains(kTelvaneUserInfoServiceName));
+}
+
+bool isListed(const Value& names, std::string_view wanted) {
+  const Array* array = names.array();
+  return array != nullptr &&
+         std::any_of(array->begin(), array->end(), [wanted](const Value& name) { return name.text() == wanted; });
 }
 
 std::string listOf(const Value& names) {
@@ -70,15 +83,15 @@ Result<Dictionary> DaemonCommands::fetchStatus() {
 }
 
 Result<void> DaemonCommands::send(const MessageOptions& options) {
-  const Result<std::shared_ptr<ClientSession>> session = openSession(options);
-  if (session.has_error()) return session.error();
-  const Result<void> sent = sendMessages(**session, options);
+  const Result<OpenSession> opened = openSession(options);
+  if (opened.has_error()) return opened.error();
+  const Result<void> sent = sendMessages(*opened->session, options);
   if (sent.has_error()) return sent.error();
   if (options.isFlushing) {
-    const Result<void> flushed = flush(**session);
+    const Result<void> flushed = flush(*opened->session);
     if (flushed.has_error()) return flushed.error();
   }
-  return settle(*session);
+  return settle(opened->session);
 }
 
 Result<void> DaemonCommands::oneShot(const MessageOptions& options) {
@@ -105,22 +118,36 @@ Result<void> DaemonCommands::oneShot(const MessageOptions& options) {
 }
 
 Result<void> DaemonCommands::upload(const MessageOptions& options) {
-  const Result<std::shared_ptr<ClientSession>> session = openSession(options);
-  if (session.has_error()) return session.error();
-  if (!(*session)->serverSupportsFileUpload())
+  const Result<OpenSession> opened = openSession(options);
+  if (opened.has_error()) return opened.error();
+  if (!isListed(opened->backendNames, kTelvaneBackendUploadServer.view()))
     return fault("the storebag of this client type enables no upload server");
-  Answer<bool> answer(_context.platform().dispatch);
-  const bool isTaken = (*session)->uploadFileWithURL(
-      options.uploadFile, [giver = answer.giver()](bool isSuccess, const std::optional<Error>& error) mutable {
-        giver.give(isSuccess && !error.has_value());
-      });
-  if (!isTaken) return fault("cannot read " + options.uploadFile);
-  if (!answer.waitFor(kPatience).value_or(false)) return fault("the upload failed; the daemon's log says why");
-  _printer.line("uploaded: " + options.uploadFile);
-  return settle(*session);
+  const Result<void> handedOver = handOver(*opened->session, options.uploadFile);
+  if (handedOver.has_error()) return handedOver.error();
+  const bool isStillThere = PosixFileSystem(Paths{}).modificationDate(pathOfFileURL(options.uploadFile)).has_value();
+  _printer.line(isStillThere ? "posted: " + options.uploadFile +
+                                   "; it is still there, so the server has not said success, or the daemon may not "
+                                   "delete it: its log says which"
+                             : "uploaded: " + options.uploadFile);
+  return settle(opened->session);
 }
 
-Result<std::shared_ptr<ClientSession>> DaemonCommands::openSession(const MessageOptions& options) {
+Result<void> DaemonCommands::handOver(ClientSession& session, const std::string& file) {
+  Answer<bool> answer(_context.platform().dispatch);
+  const bool isTaken = session.uploadFileWithURL(
+      file, [giver = answer.giver()](bool isSuccess, const std::optional<Error>& error) mutable {
+        giver.give(isSuccess && !error.has_value());
+      });
+  if (!isTaken) return fault("cannot read " + file);
+  const std::optional<bool> isPosted = answer.waitFor(kUploadPatience);
+  if (!isPosted.has_value()) return fault("the daemon ended the session, or did not answer; its log says why");
+  if (*isPosted) return {};
+  return fault("the daemon refused " + file +
+               ": it uploads a regular file that is not empty and no link, as far as its disk has room for a "
+               "compressed copy; its log says what it was");
+}
+
+Result<DaemonCommands::OpenSession> DaemonCommands::openSession(const MessageOptions& options) {
   const Result<Value> userInfo = options.makeUserInfo();
   if (userInfo.has_error()) return userInfo.error();
   const Result<Dictionary> sessionInfo = options.makeSessionInfo(currentProcessID());
@@ -137,19 +164,19 @@ Result<std::shared_ptr<ClientSession>> DaemonCommands::openSession(const Message
     return fault("no session: it is switched off, or this user may not reach the daemon's socket");
   session->setMessageLoggingBlock([&printer = _printer](const String& text) { printer.line(text.view()); });
   if (digestKey->isPresent()) session->setDigestKey(*digestKey, 0);
-  const Result<void> configured = configure(*session);
+  const Result<Value> configured = configure(*session);
   if (configured.has_error()) return configured.error();
-  return session;
+  return OpenSession{std::move(session), *configured};
 }
 
-Result<void> DaemonCommands::configure(ClientSession& session) {
+Result<Value> DaemonCommands::configure(ClientSession& session) {
   Answer<Value> answer(_context.platform().dispatch);
   session.startConfigurationWithCompletionHandler(
       [giver = answer.giver()](const Value& enabledBackendNames) mutable { giver.give(enabledBackendNames); });
   const std::optional<Value> names = answer.waitFor(kPatience);
   if (!names.has_value()) return fault("the daemon ended the session, or did not answer; its log says why");
   _printer.line("enabled backends: " + listOf(*names));
-  return {};
+  return *names;
 }
 
 Result<void> DaemonCommands::sendMessages(ClientSession& session, const MessageOptions& options) {

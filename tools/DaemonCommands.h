@@ -23,14 +23,22 @@ class DaemonCommands {
   Result<void> send(const MessageOptions& options);
   // Sends one message without a session.
   Result<void> oneShot(const MessageOptions& options);
-  // Opens a session, configures it, and uploads the file.
+  // Opens a session, configures it, and uploads the file, of which the daemon leaves nothing behind when the server has
+  // said "success".
   Result<void> upload(const MessageOptions& options);
 
  private:
   Result<Dictionary> fetchStatus();
+  // A configured session, and the names of its backends as the daemon told them: the session knows them a moment later.
+  struct OpenSession {
+    std::shared_ptr<ClientSession> session;
+    Value backendNames;
+  };
   // Opens and configures a session whose textual answers are printed.
-  Result<std::shared_ptr<ClientSession>> openSession(const MessageOptions& options);
-  Result<void> configure(ClientSession& session);
+  Result<OpenSession> openSession(const MessageOptions& options);
+  Result<Value> configure(ClientSession& session);
+  // Hands the file over and waits as long as the daemon takes for it.
+  Result<void> handOver(ClientSession& session, const std::string& file);
   Result<void> sendMessages(ClientSession& session, const MessageOptions& options);
   Result<void> flush(ClientSession& session);
   // Waits until everything that was sent has been answered.

@@ -27,6 +27,7 @@ target_sources(telvane_platform PRIVATE
   ${CMAKE_CURRENT_LIST_DIR}/PropertyListNode.cpp
   ${CMAKE_CURRENT_LIST_DIR}/PropertyListUserDefaults.cpp
   ${CMAKE_CURRENT_LIST_DIR}/PropertyListXMLScan.cpp
+  ${CMAKE_CURRENT_LIST_DIR}/ReceivedFile.cpp
   ${CMAKE_CURRENT_LIST_DIR}/ServiceManager.cpp
   ${CMAKE_CURRENT_LIST_DIR}/SuiteLock.cpp
   ${CMAKE_CURRENT_LIST_DIR}/SystemDeviceAnswers.cpp

@@ -24,9 +24,10 @@ using ErrorCode = boost::system::error_code;
 
 class HTTPServer::Core : public std::enable_shared_from_this<HTTPServer::Core> {
  public:
-  Core(Options options, Handler handler)
+  Core(Options options, Handler handler, SinkMaker sinkMaker)
       : _options(std::move(options)),
         _handler(std::move(handler)),
+        _sinkMaker(std::move(sinkMaker)),
         _context(std::make_shared<asio::io_context>(static_cast<int>(std::max(1u, _options.threads)))),
         _acceptor(asio::make_strand(*_context)),
         _pause(_acceptor.get_executor()) {}
@@ -50,6 +51,7 @@ class HTTPServer::Core : public std::enable_shared_from_this<HTTPServer::Core> {
   // Constant after open.
   const Options _options;
   const Handler _handler;
+  const SinkMaker _sinkMaker;
   std::string _address;
   uint16_t _port = 0;
   std::optional<asio::ssl::context> _tls;
@@ -76,10 +78,10 @@ void HTTPServer::Core::open() {
   _port = _acceptor.local_endpoint().port();
   const char* format = endpoint.address().is_v6() ? "[{}]:{}" : "{}:{}";
   _address = fmt::format(fmt::runtime(format), _options.host, _port);
-  _server = std::make_shared<const HTTPServerConnection::Server>(
-      HTTPServerConnection::Server{_options, _handler, _context, [core = weak_from_this()](const auto& connection) {
-                                     if (const auto strong = core.lock()) strong->connectionEnded(connection);
-                                   }});
+  _server = std::make_shared<const HTTPServerConnection::Server>(HTTPServerConnection::Server{
+      _options, _handler, _sinkMaker, _context, [core = weak_from_this()](const auto& connection) {
+        if (const auto strong = core.lock()) strong->connectionEnded(connection);
+      }});
 }
 
 void HTTPServer::Core::useCertificate() {
@@ -149,9 +151,9 @@ void HTTPServer::Core::connectionEnded(const std::shared_ptr<HTTPServerConnectio
   _connections.erase(connection);
 }
 
-Result<std::unique_ptr<HTTPServer>> HTTPServer::start(Options options, Handler handler) {
+Result<std::unique_ptr<HTTPServer>> HTTPServer::start(Options options, Handler handler, SinkMaker sinkMaker) {
   try {
-    auto core = std::make_shared<Core>(std::move(options), std::move(handler));
+    auto core = std::make_shared<Core>(std::move(options), std::move(handler), std::move(sinkMaker));
     core->open();
     core->run();
     return std::unique_ptr<HTTPServer>(new HTTPServer(std::move(core)));

@@ -26,24 +26,35 @@ class HTTPServer {
     // PEM files of the certificate with its chain and of its key; both empty: plain http.
     std::string certificateFile;
     std::string privateKeyFile;
-    // Answered with 413 and 431 when exceeded; the connection ends.
+    // Answered with 413 and 431 when exceeded; the connection ends. The first holds for bodies that are gathered.
     uint64_t maximumBodyBytes = 64ull << 20;
     uint32_t maximumHeadBytes = 64u << 10;
     // More are closed at once.
     size_t maximumConnections = 1024;
-    // For a whole request from its first byte, for the TLS handshake, and for a peer to take a piece of the response.
+    // For a whole request from its first byte, for each piece of a body that goes to a sink, for the TLS handshake, and
+    // for a peer to take a piece of the response.
     std::chrono::milliseconds transferTimeout = std::chrono::seconds(60);
     // Between requests.
     std::chrono::milliseconds idleTimeout = std::chrono::seconds(120);
     unsigned threads = 1;
   };
 
+  // Takes the body of one request in pieces, so that it need not fit into memory. Kept by the request's connection,
+  // then by the request; let go of earlier when the connection ends before the body.
+  class BodySink {
+   public:
+    virtual ~BodySink() = default;
+    // Returns 0 to go on, or the HTTP status that refuses the request and ends its connection.
+    virtual int take(std::string_view piece) = 0;
+  };
+
   struct Request {
     std::string method;
     std::string target;           // as sent, not decoded
     std::vector<Header> headers;  // names as sent and in that order, those of one name side by side
-    Data body;                    // as sent, not decompressed
+    Data body;                    // as sent, not decompressed; empty when a sink has taken it
     std::string peerAddress;      // HOST:PORT
+    std::shared_ptr<BodySink> sink;
 
     // The value of the first header of that name, compared without regard to case; null when there is none.
     const std::string* header(std::string_view name) const noexcept;
@@ -73,8 +84,13 @@ class HTTPServer {
   // Called on one of the server's threads for each request; while it runs, that thread serves nobody else.
   using Handler = std::function<void(Request request, std::shared_ptr<Responder> responder)>;
 
-  // Opens the socket and starts to serve. Fails when the address or the certificate cannot be used.
-  static Result<std::unique_ptr<HTTPServer>> start(Options options, Handler handler);
+  // Called on one of the server's threads with a request whose body was not read yet. Returns what takes the body, or
+  // null to have it gathered.
+  using SinkMaker = std::function<std::shared_ptr<BodySink>(const Request& head)>;
+
+  // Opens the socket and starts to serve. Fails when the address or the certificate cannot be used. sinkMaker: may be
+  // empty; all bodies are gathered then.
+  static Result<std::unique_ptr<HTTPServer>> start(Options options, Handler handler, SinkMaker sinkMaker = nullptr);
   // Closes everything and waits for the threads. Not from a handler.
   ~HTTPServer();
   HTTPServer(const HTTPServer&) = delete;

@@ -24,6 +24,9 @@ namespace {
 using ErrorCode = boost::system::error_code;
 using TLSStream = beast::ssl_stream<beast::tcp_stream>;
 using Parser = http::request_parser<http::vector_body<uint8_t>>;
+using PieceParser = http::request_parser<http::buffer_body>;
+
+constexpr size_t kPieceBytes = 64u << 10;
 
 // What is to be written, kept until it has been.
 struct Piece {
@@ -64,6 +67,19 @@ int statusFor(ErrorCode error) {
   return error.category() == http::make_error_code(http::error::bad_method).category() ? 400 : 0;
 }
 
+// What a handler is told of a request, but for its body.
+template <class Message>
+HTTPServer::Request headOf(const Message& message, const std::string& peerAddress) {
+  HTTPServer::Request request;
+  request.method = std::string(message.method_string());
+  request.target = std::string(message.target());
+  for (const auto& field : message) {
+    request.headers.push_back({std::string(field.name_string()), std::string(field.value())});
+  }
+  request.peerAddress = peerAddress;
+  return request;
+}
+
 template <class Stream>
 class Connection final : public HTTPServerConnection {
  public:
@@ -90,12 +106,16 @@ class Connection final : public HTTPServerConnection {
   void limit(std::chrono::milliseconds time) { beast::get_lowest_layer(_stream).expires_after(time); }
   void readHead();
   void headCame(ErrorCode error);
+  void chooseSink();
   void continueThenReadBody();
   void readBody();
+  void readPiece();
+  void pieceCame(ErrorCode error);
   void requestCame(ErrorCode error);
   HTTPServer::Request takeRequest();
   void handle(HTTPServer::Request request);
   void refuse(ErrorCode error);
+  void refuseWith(int status);
   void writeNext();
   void wasWritten(ErrorCode error);
   void answerEnded();
@@ -109,6 +129,10 @@ class Connection final : public HTTPServerConnection {
   // Confined to the strand.
   beast::flat_buffer _buffer;
   std::optional<Parser> _parser;
+  // While a sink takes the body, in place of the other.
+  std::optional<PieceParser> _pieceParser;
+  std::optional<HTTPServer::Request> _pieceRequest;
+  std::vector<char> _piece;
   uint64_t _answer = 0;  // counts the requests that were read
   bool _isAnswering = false;
   bool _keepsAlive = true;
@@ -194,7 +218,7 @@ void Connection<Stream>::readHead() {
   const HTTPServer::Options& options = _server->options;
   _parser.emplace();
   _parser->header_limit(options.maximumHeadBytes);
-  _parser->body_limit(options.maximumBodyBytes);
+  _parser->body_limit(boost::none);  // until it is known who takes the body
   if (_buffer.size() > 0) {
     limit(options.transferTimeout);
     return http::async_read_header(_stream, _buffer, *_parser,
@@ -215,8 +239,29 @@ void Connection<Stream>::readHead() {
 template <class Stream>
 void Connection<Stream>::headCame(ErrorCode error) {
   if (error) return refuse(error);
-  const bool isToContinue = beast::iequals(_parser->get()[http::field::expect], "100-continue");
+  const auto& head = _parser->get();
+  _keepsAlive = head.keep_alive();
+  _isHeadRequest = head.method() == http::verb::head;
+  const bool isToContinue = beast::iequals(head[http::field::expect], "100-continue");
+  chooseSink();
+  if (!_pieceRequest) {
+    const uint64_t maximum = _server->options.maximumBodyBytes;
+    _parser->body_limit(maximum);
+    if (_parser->content_length().value_or(0) > maximum) return refuse(http::error::body_limit);
+  }
   isToContinue ? continueThenReadBody() : readBody();
+}
+
+template <class Stream>
+void Connection<Stream>::chooseSink() {
+  if (!_server->sinkMaker || _parser->is_done()) return;
+  HTTPServer::Request head = headOf(_parser->get(), _peerAddress);
+  head.sink = _server->sinkMaker(head);
+  if (head.sink == nullptr) return;
+  _pieceRequest = std::move(head);
+  _pieceParser.emplace(std::move(*_parser));
+  _pieceParser->body_limit(boost::none);
+  _piece.resize(kPieceBytes);
 }
 
 template <class Stream>
@@ -228,16 +273,36 @@ void Connection<Stream>::continueThenReadBody() {
 
 template <class Stream>
 void Connection<Stream>::readBody() {
+  if (_pieceRequest) return readPiece();
   if (_parser->is_done()) return requestCame({});
   http::async_read(_stream, _buffer, *_parser, [self = self()](ErrorCode error, size_t) { self->requestCame(error); });
+}
+
+template <class Stream>
+void Connection<Stream>::readPiece() {
+  auto& body = _pieceParser->get().body();
+  body.data = _piece.data();
+  body.size = _piece.size();
+  limit(_server->options.transferTimeout);
+  http::async_read_some(_stream, _buffer, *_pieceParser,
+                        [self = self()](ErrorCode error, size_t) { self->pieceCame(error); });
+}
+
+template <class Stream>
+void Connection<Stream>::pieceCame(ErrorCode error) {
+  if (_hasEnded) return;
+  // need_buffer: the room for a piece was filled.
+  if (error && error != http::error::need_buffer) return refuse(error);
+  const size_t size = _piece.size() - _pieceParser->get().body().size;
+  const int status = size > 0 ? _pieceRequest->sink->take({_piece.data(), size}) : 0;
+  if (status != 0) return refuseWith(status);
+  _pieceParser->is_done() ? requestCame({}) : readPiece();
 }
 
 template <class Stream>
 void Connection<Stream>::requestCame(ErrorCode error) {
   if (error) return refuse(error);
   beast::get_lowest_layer(_stream).expires_never();
-  _keepsAlive = _parser->get().keep_alive();
-  _isHeadRequest = _parser->get().method() == http::verb::head;
   _isAnswering = true;
   ++_answer;
   handle(takeRequest());
@@ -245,15 +310,13 @@ void Connection<Stream>::requestCame(ErrorCode error) {
 
 template <class Stream>
 HTTPServer::Request Connection<Stream>::takeRequest() {
-  auto message = _parser->release();
-  HTTPServer::Request request;
-  request.method = std::string(message.method_string());
-  request.target = std::string(message.target());
-  for (const auto& field : message) {
-    request.headers.push_back({std::string(field.name_string()), std::string(field.value())});
+  if (_pieceRequest) {
+    _pieceParser.reset();
+    return *std::exchange(_pieceRequest, std::nullopt);
   }
+  auto message = _parser->release();
+  HTTPServer::Request request = headOf(message, _peerAddress);
   request.body = Data(std::move(message.body()));
-  request.peerAddress = _peerAddress;
   return request;
 }
 
@@ -270,7 +333,12 @@ void Connection<Stream>::handle(HTTPServer::Request request) {
 template <class Stream>
 void Connection<Stream>::refuse(ErrorCode error) {
   const int status = statusFor(error);
-  if (status == 0) return hangUp();
+  status == 0 ? hangUp() : refuseWith(status);
+}
+
+template <class Stream>
+void Connection<Stream>::refuseWith(int status) {
+  _pieceRequest.reset();
   _keepsAlive = false;
   _isHeadRequest = false;
   _isAnswering = true;
@@ -352,6 +420,7 @@ void Connection<Stream>::hangUp() {
 template <class Stream>
 void Connection<Stream>::end() {
   if (std::exchange(_hasEnded, true)) return;
+  _pieceRequest.reset();
   ErrorCode ignored;
   socket().close(ignored);
   beast::get_lowest_layer(_stream).close();

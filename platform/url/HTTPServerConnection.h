@@ -19,6 +19,7 @@ class HTTPServerConnection : public std::enable_shared_from_this<HTTPServerConne
   struct Server {
     HTTPServer::Options options;
     HTTPServer::Handler handler;
+    HTTPServer::SinkMaker sinkMaker;  // may be empty
     std::shared_ptr<boost::asio::io_context> context;
     std::function<void(const std::shared_ptr<HTTPServerConnection>&)> connectionEnded;
   };

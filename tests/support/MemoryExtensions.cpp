@@ -1,11 +1,19 @@
 #include "tests/support/MemoryExtensions.h"
 
+#include <sys/mman.h>
+#include <sys/stat.h>
+
+#include <algorithm>
 #include <cerrno>
 
 namespace telvane::testing {
 namespace {
 
-constexpr int kFirstToken = 1 << 24;
+// What all duplicates of a descriptor have in common; 0 for what is none.
+uint64_t nodeOf(int descriptor) {
+  struct stat status {};
+  return ::fstat(descriptor, &status) == 0 ? status.st_ino : 0;
+}
 
 Error refusal(int code, const std::string& reason) {
   return Error::withDescription(kPlatformErrorDomain, code, reason);
@@ -15,7 +23,7 @@ Error refusal(int code, const std::string& reason) {
 
 class MemoryExtensions::Extension final : public SandboxExtension {
  public:
-  Extension(MemoryExtensions& owner, int token, std::string path)
+  Extension(MemoryExtensions& owner, uint64_t token, std::string path)
       : _owner(owner), _token(token), _path(std::move(path)) {
     MutexLock lock(_owner._mutex);
     ++_owner._heldExtensions;
@@ -25,10 +33,7 @@ class MemoryExtensions::Extension final : public SandboxExtension {
     --_owner._heldExtensions;
   }
 
-  bool isRegularFile() const override {
-    const Grant granted = grant();
-    return granted.path == _path && !granted.isReplaced && content().has_value();
-  }
+  bool isRegularFile() const override { return grantedPath() == _path && !isReplaced() && content().has_value(); }
   Result<uint64_t> size() const override {
     const Result<Data> bytes = content();
     if (bytes.has_error()) return bytes.error();
@@ -44,7 +49,7 @@ class MemoryExtensions::Extension final : public SandboxExtension {
     return bytes->view().substr(std::min<uint64_t>(offset, bytes->size())).copy(buffer, length);
   }
   Result<void> removeFile() override {
-    if (grant().isReplaced) return refusal(ESTALE, "its path names another file now");
+    if (isReplaced()) return refusal(ESTALE, "its path names another file now");
     {
       MutexLock lock(_owner._mutex);
       if (!_owner._removalRefusal.empty()) return refusal(EACCES, _owner._removalRefusal);
@@ -53,22 +58,27 @@ class MemoryExtensions::Extension final : public SandboxExtension {
   }
 
  private:
-  Grant grant() const {
+  std::string grantedPath() const {
     MutexLock lock(_owner._mutex);
-    return _owner._grants.at(_token);
+    return _owner._grants.at(_token).path;
   }
-  Result<Data> content() const { return _owner._files.read(grant().path, UINT64_MAX); }
+  bool isReplaced() const {
+    MutexLock lock(_owner._mutex);
+    return _owner._grants.at(_token).isReplaced;
+  }
+  Result<Data> content() const { return _owner._files.read(grantedPath(), UINT64_MAX); }
 
   MemoryExtensions& _owner;
-  const int _token;
+  const uint64_t _token;
   const std::string _path;
 };
 
 ExtensionToken MemoryExtensions::newToken(const std::string& path) {
   MutexLock lock(_mutex);
-  const int token = kFirstToken + static_cast<int>(_grants.size());
-  _grants[token] = Grant{path};
-  return {.descriptor = token, .holder = PeerIdentity()};
+  FileDescriptor descriptor(::memfd_create("token", MFD_CLOEXEC));
+  const int number = descriptor.get();
+  _grants[nodeOf(number)] = Grant{std::move(descriptor), path};
+  return {.descriptor = number, .holder = PeerIdentity()};
 }
 
 void MemoryExtensions::replace(const std::string& path) {
@@ -92,11 +102,12 @@ int MemoryExtensions::heldExtensions() const {
 }
 
 std::unique_ptr<SandboxExtension> MemoryExtensions::consume(const std::string& path, const ExtensionToken& token) {
+  const uint64_t node = nodeOf(token.descriptor);
   {
     MutexLock lock(_mutex);
-    if (_grants.count(token.descriptor) == 0) return nullptr;
+    if (_grants.count(node) == 0) return nullptr;
   }
-  return std::make_unique<Extension>(*this, token.descriptor, path);
+  return std::make_unique<Extension>(*this, node, path);
 }
 
 }  // namespace telvane::testing

@@ -1,11 +1,13 @@
 #pragma once
 
+#include <cstdint>
 #include <map>
 #include <string>
 
 #include "platform/FileSystem.h"
 #include "platform/Mutex.h"
 #include "platform/SandboxExtensions.h"
+#include "platform/system/FileDescriptor.h"
 
 namespace telvane::testing {
 
@@ -16,7 +18,8 @@ class MemoryExtensions final : public SandboxExtensions {
   // REQUIRES: the files outlive this object.
   explicit MemoryExtensions(FileSystem& files) : _files(files) {}
 
-  // Makes a token for the path; its descriptor is a number that no open file has, so it may be closed like one.
+  // Makes a token for the path. Its descriptor is a real one, of nothing, so that it may cross a connection; it belongs
+  // to this object, which knows its duplicates, too.
   ExtensionToken newToken(const std::string& path) EXCLUDES(_mutex);
   // From now on the path is that of something else: a symbolic link, a pipe, a folder or another file.
   void replace(const std::string& path) EXCLUDES(_mutex);
@@ -32,13 +35,14 @@ class MemoryExtensions final : public SandboxExtensions {
  private:
   class Extension;
   struct Grant {
+    FileDescriptor descriptor;
     std::string path;
     bool isReplaced = false;
   };
 
   FileSystem& _files;
   mutable Mutex _mutex;
-  std::map<int, Grant> _grants GUARDED_BY(_mutex);
+  std::map<uint64_t, Grant> _grants GUARDED_BY(_mutex);  // by the descriptor's inode
   bool _isReadingRefused GUARDED_BY(_mutex) = false;
   std::string _removalRefusal GUARDED_BY(_mutex);
   int _heldExtensions GUARDED_BY(_mutex) = 0;

@@ -2,12 +2,14 @@
 
 #include <gmock/gmock.h>
 
+#include <filesystem>
 #include <sstream>
 
 #include "interfaces/AgentKeys.h"
 #include "interfaces/ErrorCoding.h"
 #include "interfaces/TelvaneErrors.h"
 #include "tests/client/ClientFixture.h"
+#include "tests/support/ScratchFolder.h"
 
 namespace telvane::testing {
 namespace {
@@ -113,6 +115,32 @@ TEST_F(DaemonCommandsTest, uploadsNothingWithoutAnUploadServer) {
   _options.uploadFile = "/etc/hostname";
   EXPECT_THAT(faultOf(_commands.upload(_options)), HasSubstr("no upload server"));
   EXPECT_EQ(daemon().count(Operation::UploadFileAtPath), 0u);
+}
+
+TEST_F(DaemonCommandsTest, uploadsAFileAndSaysWhetherItIsStillThere) {
+  ScratchFolder folder;
+  daemon().answer(Operation::StartConfig, Array{Array{"splunk", "upload_server"}, Value(), Array{99}});
+  daemon().answer(Operation::UploadFileAtPath, Array{true});
+  _options.uploadFile = folder.write("log", "text");
+  EXPECT_EQ(faultOf(_commands.upload(_options)), "none");
+  EXPECT_THAT(printed(), HasSubstr("posted: " + _options.uploadFile + "; it is still there"));
+  _output.str("");
+  daemon().answer(Operation::UploadFileAtPath, [&](const ScriptedDaemon::Call&, ipc::ReplyBlock reply) {
+    std::filesystem::remove(_options.uploadFile);
+    reply(Array{true});
+  });
+  EXPECT_EQ(faultOf(_commands.upload(_options)), "none");
+  EXPECT_THAT(printed(), HasSubstr("uploaded: " + _options.uploadFile + "\n"));
+}
+
+TEST_F(DaemonCommandsTest, saysThatTheDaemonRefusesAFile) {
+  ScratchFolder folder;
+  daemon().answer(Operation::StartConfig, Array{Array{"upload_server"}, Value(), Array{99}});
+  daemon().answer(Operation::UploadFileAtPath, Array{false});
+  _options.uploadFile = folder.write("log", "text");
+  EXPECT_THAT(faultOf(_commands.upload(_options)), HasSubstr("the daemon refused " + _options.uploadFile));
+  _options.uploadFile = folder.at("nothing");
+  EXPECT_EQ(faultOf(_commands.upload(_options)), "cannot read " + _options.uploadFile);
 }
 
 TEST_F(DaemonCommandsTest, showsTheStatusForPeopleAndAsJSON) {

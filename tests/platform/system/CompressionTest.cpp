@@ -46,6 +46,31 @@ TEST(CompressionTest, inflatesWhatItDeflated) {
   }
 }
 
+std::string deflatedInPieces(Framing framing, std::string_view input, size_t pieceSize) {
+  auto deflater = Deflater::make(framing);
+  EXPECT_TRUE(deflater.has_value());
+  std::string output;
+  for (; !input.empty(); input.remove_prefix(std::min(pieceSize, input.size()))) {
+    EXPECT_TRUE(deflater->add(input.substr(0, pieceSize), output).has_value());
+  }
+  EXPECT_TRUE(deflater->finish(output).has_value());
+  return output;
+}
+
+TEST(CompressionTest, deflatesPiecesToTheSameAsTheWhole) {
+  for (const std::string& input : {std::string(), std::string("x"), std::string(300000, 'a'), variedText(300000)}) {
+    for (const Framing framing : {Framing::Zlib, Framing::Gzip}) {
+      const std::string inOne = deflatedInPieces(framing, input, input.size() + 1);
+      for (const size_t size : {size_t{7}, size_t{1000}, size_t{65536}}) {
+        EXPECT_TRUE(deflatedInPieces(framing, input, size) == inOne) << input.size() << " in pieces of " << size;
+      }
+      const Result<Data> inflated = inflate(inOne, kEnough);
+      ASSERT_TRUE(succeeds(inflated));
+      EXPECT_TRUE(inflated->view() == input) << "expected " << input.size() << " bytes, got " << inflated->size();
+    }
+  }
+}
+
 TEST(CompressionTest, refusesMoreContentThanAllowed) {
   const Data bomb = deflated(Framing::Gzip, std::string(1u << 20, '\0'));
   EXPECT_TRUE(succeeds(inflate(bomb.view(), 1u << 20)));

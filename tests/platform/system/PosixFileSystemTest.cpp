@@ -7,6 +7,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
 #include <filesystem>
 
@@ -193,6 +194,30 @@ TEST_F(PosixFileSystemTest, livesBelowTheRootOfItsInstance) {
   ASSERT_TRUE(succeeds(_files.write("/var/mobile/file", bytes("x"))));
   EXPECT_EQ(_folder.read("root/var/mobile/file"), "x");
   EXPECT_TRUE(succeeds(_files.setProtectionNone("/var/mobile/file")));
+}
+
+TEST_F(PosixFileSystemTest, aTemporaryFileHasNoNameAndGivesBackWhatWasPutIn) {
+  PosixFileSystem files(Paths{});
+  const std::string folder = _folder.at("a/b");
+  const auto file = files.newTemporaryFile(folder);
+  ASSERT_TRUE(succeeds(file));
+  EXPECT_EQ((*file)->size(), 0u);
+  EXPECT_TRUE(succeeds((*file)->append("0123")));
+  EXPECT_TRUE(succeeds((*file)->append("456789")));
+  EXPECT_EQ((*file)->size(), 10u);
+  std::array<char, 4> buffer{};
+  EXPECT_EQ((*file)->read(0, buffer), 4);
+  EXPECT_EQ(std::string_view(buffer.data(), 4), "0123");
+  EXPECT_EQ((*file)->read(8, buffer), 2);
+  EXPECT_EQ(std::string_view(buffer.data(), 2), "89");
+  EXPECT_EQ((*file)->read(10, buffer), 0);
+  EXPECT_EQ((*file)->read(11, buffer), 0);
+  EXPECT_EQ(listing(), (std::vector<std::string>{"a", "a/b"}));
+}
+
+TEST_F(PosixFileSystemTest, makesNoTemporaryFileWhereThereIsNoFolder) {
+  PosixFileSystem files(Paths{});
+  EXPECT_FALSE(files.newTemporaryFile(_folder.write("file", "x")).has_value());
 }
 
 }  // namespace
