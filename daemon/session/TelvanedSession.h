@@ -96,6 +96,13 @@ class TelvanedSession : public ClientSessionInterface, public std::enable_shared
 
   // The estimated bytes that the backends hold in batches.
   uint64_t batchedEventsSize() const;
+  // Adds the session to the report's figures of its client type and returns its batchedEventsSize(). The total so far is
+  // read as a 32-bit number, so one above 2^31 wraps. REQUIRES: the agent's monitor() held, unless it is this session.
+  uint64_t addSessionHealthInfo(const TelvanedSession& session, Dictionary& healthReport) const;
+  // Adds the listed sessions, this one (once more, where it is listed), the storebags and the process's memory.
+  void addSessionsAccumulatedHealthInfoToPayload(Dictionary& payload,
+                                                 const std::vector<std::shared_ptr<TelvanedSession>>& sessionList,
+                                                 const Dictionary& storebags) const;
 
  private:
   TelvanedSession(const ProcessContext& context, SessionShared& shared,
@@ -141,11 +148,7 @@ class TelvanedSession : public ClientSessionInterface, public std::enable_shared
   Value fetchBlacklistedEvents() const;
   void replyStates(StatesReply& reply) const;
 
-  // Health report and one-shot messages.
-  uint64_t addSessionHealthInfo(const TelvanedSession& session, Dictionary& healthReport) const;
-  void addSessionsAccumulatedHealthInfoToPayload(Dictionary& payload,
-                                                 const std::vector<std::shared_ptr<TelvanedSession>>& sessionList,
-                                                 const Dictionary& storebags) const;
+  // One-shot messages.
   void sendOneMessageWithSessionInfo(const Dictionary& sessionInfo, const Value& userInfo, const Dictionary& storebag,
                                      uint16_t category, uint16_t type, const Dictionary& payload);
   void sendOneMessageToBackend(TelvaneBackend& backend, Date timestamp, uint16_t category, uint16_t type,

@@ -119,6 +119,13 @@ TEST_F(TelvanedAgentHierarchyTest, filingTwiceAddsOnce) {
   EXPECT_TRUE(hasLines(log(), 2, "as it has proper entitlement, 0(0) connections."));
 }
 
+TEST_F(TelvanedAgentHierarchyTest, aSessionThatIsFiledAgainStandsBehindItsSiblings) {
+  givenLevels({0, 1, 1, 2});
+  EXPECT_EQ(parentOf(4), 2u);
+  agent().updateCorrelatedSessions(*kept[1]);
+  EXPECT_EQ(parentOf(4), 3u);
+}
+
 TEST_F(TelvanedAgentHierarchyTest, aSessionThatChangesItsTokenLeavesTheOldOne) {
   givenLevels({0, 1});
   clients[0]->setSessionInfo(sessionInfoIn("b", 0, 1), userInfo());
@@ -245,6 +252,39 @@ TEST_F(TelvanedAgentHierarchyTest, onlyTheTopmostAggregatorStaysOpenAfterARefres
   const Array theEnd{Value(), 0.0, 0, 0, Value()};
   ASSERT_EQ(clients[1]->aggregated().size(), 1u);
   EXPECT_EQ(clients[1]->aggregated()[0], theEnd);
+}
+
+TEST_F(TelvanedAgentHierarchyTest, aTopSessionWithAnAggregatorHearsItsDescendantsAndItself) {
+  givenStorebag();
+  givenLevels({0, 1, 2}, {0});
+  for (const auto& client : clients) client->start();
+  const size_t before = clients[0]->aggregated().size();
+  clients[1]->send(7);
+  clients[2]->send(8);
+  clients[0]->send(9);
+  std::vector<int64_t> heard;
+  for (const Array& call : clients[0]->aggregated()) heard.push_back(call[2].integerValue());
+  heard.erase(heard.begin(), heard.begin() + static_cast<std::ptrdiff_t>(before));
+  EXPECT_THAT(heard, ::testing::ElementsAre(7, 8, 9));
+}
+
+TEST_F(TelvanedAgentHierarchyTest, anAggregatorStaysOpenWhereNobodyAboveAggregates) {
+  givenStorebag();
+  givenLevels({0, 1, 2}, {2});
+  for (const auto& client : clients) client->start();
+  EXPECT_TRUE(kept[2]->hasAggregator());
+  clients[2]->send(7);
+  EXPECT_EQ(clients[2]->aggregated().back()[2], Value(7));
+  const Array theEnd{Value(), 0.0, 0, 0, Value()};
+  EXPECT_THAT(clients[2]->aggregated(), ::testing::Not(::testing::Contains(theEnd)));
+}
+
+TEST_F(TelvanedAgentHierarchyTest, aRefreshReachesThoseBelowAlone) {
+  givenStorebag();
+  givenLevels({0, 1, 1, 2});
+  clients[1]->start();
+  EXPECT_TRUE(hasLines(log(), 1, "updateDownstreamSessions: Updating combined session ID"));
+  EXPECT_TRUE(hasLine(log(), "and syncing reporting states for session 4"));
 }
 
 TEST_F(TelvanedAgentHierarchyTest, aRefreshBelowAnAggregatingAncestorClosesItsOwnAggregator) {

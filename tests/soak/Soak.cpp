@@ -35,8 +35,9 @@ constexpr uint64_t kMostMillisecondsAway = 1500;
 // What a daemon at rest may take more than at the end of the first round.
 constexpr size_t kDescriptorSlack = 6;
 constexpr int64_t kMemorySlack = 16 << 20;
-// What it may take more on average in the last third of the rounds than in the middle third. A few hundred KiB are in use
-// at rest; the rest is kept by the allocator's arenas, one for each thread, each as large as its worst moment so far.
+// What it may take more on average in the last third of the rounds than in the middle third. A few hundred KiB are in
+// use at rest; the rest is kept by the allocator's arenas, one for each thread, each as large as its worst moment so
+// far.
 constexpr int64_t kMemoryMargin = 4 << 20;
 
 // A sanitizer keeps freed memory and writes down every access, so that the figure says nothing of the daemon.

@@ -78,6 +78,35 @@ TEST_F(TelvanedSessionHealthTest, sumsWhatWaitsInBatches) {
   EXPECT_EQ(lastStop()["BatchSize_MEDIA"].unsignedValue(), full + empty) << full << " and " << empty;
 }
 
+// Readers of the report know it so: what a total exceeds 31 bits by is counted from the other end.
+TEST_F(TelvanedSessionHealthTest, aBatchTotalIsReadBackAsA32BitNumber) {
+  constexpr int64_t kMost = INT32_MAX;
+  givenStorebag();
+  const auto client = startSession();
+  const auto session = sessions()[0];
+  const auto size = static_cast<int64_t>(session->batchedEventsSize());
+  ASSERT_GT(size, 0);
+  Dictionary full{{Key("BatchSize_MEDIA"), kMost}};
+  EXPECT_EQ(session->addSessionHealthInfo(*session, full), static_cast<uint64_t>(size));
+  EXPECT_EQ(full["BatchSize_MEDIA"], Value(kMost + size)) << "what is added is no 32-bit number";
+  session->addSessionHealthInfo(*session, full);
+  EXPECT_EQ(full["BatchSize_MEDIA"], Value(kMost + size - (int64_t{1} << 32) + size));
+}
+
+TEST_F(TelvanedSessionHealthTest, aSessionThatIsStillListedCountsTwice) {
+  givenStorebag();
+  const auto client = startSession();
+  const auto session = sessions()[0];
+  const auto size = static_cast<int64_t>(session->batchedEventsSize());
+  ASSERT_GT(size, 0);
+  Dictionary report;
+  session->addSessionsAccumulatedHealthInfoToPayload(report, sessions(), cachedStorebags());
+  EXPECT_THAT(report, HasEntry("SessionsCount_MEDIA", 2));
+  EXPECT_EQ(report["BatchSize_MEDIA"], Value(2 * size));
+  EXPECT_EQ(report[kHealthCalculatedMemoryUsage].integerValue(),
+            2 * size + report[kHealthStorebagsSize].integerValue());
+}
+
 TEST_F(TelvanedSessionHealthTest, tellsOfTheStorebagsAndTheProcess) {
   givenStorebag();
   auto ending = startSession();

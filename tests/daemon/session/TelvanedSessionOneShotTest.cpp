@@ -88,6 +88,16 @@ TEST_F(TelvanedSessionOneShotTest, isFiledInItsHierarchyButNeitherAggregatedNorG
   EXPECT_EQ(sessions().size(), 1u);
 }
 
+TEST_F(TelvanedSessionOneShotTest, withATokenThatIsNoDictionaryIsSentOnItsOwn) {
+  givenStorebag();
+  Dictionary info = sessionInfo();
+  info.set(kTelvaneSessionInfoHierarchyToken, "a");
+  EXPECT_EQ(statusOf(sendOne(info, userInfo())), "finished");
+  EXPECT_EQ(sessions()[0]->hierarchyToken(), std::nullopt);
+  client->close();
+  EXPECT_EQ(postedEvents(7, 2).size(), 1u);
+}
+
 TEST_F(TelvanedSessionOneShotTest, inTheMidstOfASessionLosesNothingThatWaits) {
   givenStorebag();
   client = startSession();
@@ -114,11 +124,13 @@ TEST_F(TelvanedSessionOneShotTest, withoutBackendsFinishesWithAnErrorLine) {
 
 TEST_F(TelvanedSessionOneShotTest, overTheLimitIsRefusedAndCutOff) {
   std::vector<std::unique_ptr<DaemonClient>> five;
+  givenStorebag();
   for (int i = 0; i < 5; ++i) five.push_back(openSession());
   log().expectError("exceeds number of allowed active connections for clientType 6");
   const std::string status = statusOf(sendOne(sessionInfo(), userInfo()));
   EXPECT_TRUE(status.starts_with("Exceeded maximum active reporting session limit for userInfo='{")) << status;
   EXPECT_TRUE(client->isInvalidated());
+  EXPECT_TRUE(postedEvents(7, 2).empty());
 }
 
 TEST_F(TelvanedSessionOneShotTest, respectsTheEventLists) {
