@@ -124,5 +124,20 @@ TEST_F(ExplainTest, theDaemonEnablesWhatExplainCallsEnabledAndLogsWhatItForetell
                                      "enabled backends: none");
 }
 
+// What they would do is told without doing it: explain opens no socket, and loads nothing.
+TEST_F(ExplainTest, theDaemonEnablesTheKindsThatAskForNothing) {
+  constexpr int kNobody = 9;  // the port on which datagrams are thrown away, if anybody takes them
+  Dictionary section;
+  section.set("dashboard", Dictionary{{kProfileIP, "127.0.0.1"}, {kProfilePort, kNobody}, {kProfileReliable, 10}});
+  section.set("upload_server", Dictionary{{kProfilePostURL, instance.collectorURL("/upload")}});
+  section.set("power", Dictionary());
+  section.set("vdr", Dictionary{{kProfileActive, true}});
+  expectTheDaemonDoesWhatExplainSays(7, "conferencing", bagOf(section),
+                                     "enabled backends: dashboard, upload_server, power, vdr");
+  section.set("dashboard", Dictionary{{kProfileIP, "dashboard.example"}, {kProfilePort, kNobody}});
+  section.set("upload_server", Dictionary());
+  expectTheDaemonDoesWhatExplainSays(5, "gaming", bagOf(section), "enabled backends: power");
+}
+
 }  // namespace
 }  // namespace telvane::testing
