@@ -1,5 +1,7 @@
 #include "client/OneShotSender.h"
 
+#include <chrono>
+
 #include "client/ClientSessionProxy.h"
 #include "client/SessionInfoValidation.h"
 #include "interfaces/SessionKeys.h"
@@ -7,6 +9,9 @@
 
 namespace telvane {
 namespace {
+
+// After that the next event is sent all the same: one that waits for the daemon's first storebag holds up no others.
+constexpr std::chrono::seconds kAnswerPatience{10};
 
 bool refuse(std::optional<Error>* error, const char* reason) {
   if (error != nullptr) *error = makeTelvaneError(reason, static_cast<int64_t>(TelvaneErrorCode::MessageRefused));
@@ -48,17 +53,22 @@ void OneShotSender::send(ClientContext& context, Message message) {
   connection->setInterruptionHandler(
       [&log] { log.message("sendOneMessageWithSessionInfo: XPC connection interrupted"); });
   connection->resume();
+  const std::shared_ptr<Semaphore> isAnswered = context.platform().dispatch.newSemaphore(0);
   // The answer holds the connection, which is kept by nothing else, until it comes or can no longer come.
-  auto reply = [connection, &log, hold = PendingWork::Hold(context.pendingWork())](const Value& status) {
+  auto reply = [connection, &log, isAnswered, hold = PendingWork::Hold(context.pendingWork())](const Value& status) {
     log.message("{}", status);
     connection->invalidate();
+    isAnswered->signal();
   };
-  auto onError = [&log](const Error&) {
+  auto onError = [&log, isAnswered](const Error&) {
     log.error("sendOneMessageWithSessionInfo: Failed to get remote object proxy");
+    isAnswered->signal();
   };
   ClientSessionProxy::remoteObjectProxyWithErrorHandler(*connection, std::move(onError))
       .sendMessageForStatusValue(std::move(message.sessionInfo), std::move(message.userInfo), message.category,
                                  message.type, std::move(message.payload), std::move(reply));
+  // Each connection is a session to the daemon, which cuts off a sixth of one client type.
+  isAnswered->waitFor(kAnswerPatience);
 }
 
 }  // namespace telvane

@@ -28,9 +28,9 @@ void TelvanedAgent::updateCorrelatedSessions(TelvanedSession& session) {
   }
   log().message("updateCorrelatedSessions: Adding session {} to list for hierarchyToken {} with hierarchyLevel {}",
                 session.sessionID(), *token, session.hierarchyLevel());
+  _correlatedSessions[token->str()].push_back(session.weak_from_this());
   // A hierarchy that the move left empty stays until its session ends; unless one session makes more and more of them.
   if (_correlatedSessions.size() > _sessionList.size() + kMaximumEmptyHierarchies) forgetEmptyHierarchies();
-  _correlatedSessions[token->str()].push_back(session.weak_from_this());
 }
 
 void TelvanedAgent::forgetEmptyHierarchies() {

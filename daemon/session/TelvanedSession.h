@@ -127,6 +127,8 @@ class TelvanedSession : public ClientSessionInterface, public std::enable_shared
   bool isNameChanged(const Value& newUserInfo, const Key& nameKey) const;
   void updateUserInfoForBackends();
   void activateHelperOfEnabledBackends();
+  // To be called before anything may be posted: a helper that nobody activated posts nothing.
+  void activateHelperIfEnabledByParent();
   void createBackendsWithStorebag(const Dictionary& storebag);
   void updateSessionWithDefaultSessionInfo();
   void sendStartMessage();
@@ -185,6 +187,9 @@ class TelvanedSession : public ClientSessionInterface, public std::enable_shared
   // Synchronised by themselves, or by _connectionLock.
   std::atomic<bool> _hasAggregator{false};
   std::atomic<bool> _counted{false};
+  // Set by the parent's thread when it enables a backend that was not; the session's own thread, which alone knows its
+  // helper, sees to it.
+  std::atomic<bool> _isEnabledByParent{false};
   mutable Mutex _connectionLock;
   std::shared_ptr<ipc::Connection> _connection GUARDED_BY(_connectionLock);
   bool _isAnswering GUARDED_BY(_connectionLock) = false;

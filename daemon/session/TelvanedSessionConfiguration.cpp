@@ -62,10 +62,10 @@ bool TelvanedSession::hasValidUserInfoKeys() const {
 }
 
 void TelvanedSession::releaseUserInfo() {
-  if (_userInfo.isPresent()) {
-    _sessionDelegate->releaseSharedConnectivityHelperForReportingSession(*this);
-    _userInfo = Value();
-  }
+  // User info without a name took no helper. Released all the same, it would give up the helper of the sessions whose
+  // names are empty, which stand under the same key.
+  if (_connectivityHelper != nullptr) _sessionDelegate->releaseSharedConnectivityHelperForReportingSession(*this);
+  _userInfo = Value();
   _connectivityHelper.reset();
 }
 
@@ -120,6 +120,12 @@ void TelvanedSession::activateHelperOfEnabledBackends() {
   if (isAnyEnabled) _connectivityHelper->activate(_connectivityHelperReleaseTimeout);
 }
 
+void TelvanedSession::activateHelperIfEnabledByParent() {
+  if (_isEnabledByParent.load(std::memory_order_relaxed) && _isEnabledByParent.exchange(false)) {
+    activateHelperOfEnabledBackends();
+  }
+}
+
 void TelvanedSession::updateUserInfoForBackends() {
   if (!_backends.has_value()) return;
   for (const auto& [name, backend] : *_backends) {
@@ -164,8 +170,13 @@ void TelvanedSession::createBackendsWithStorebag(const Dictionary& storebag) {
       backend->setCombinedSessionIDString(_sessionIDString);
     }
   }
-  MonitorLock lock(_sessionDelegate->monitor());
-  _backends = std::move(backends);
+  {
+    MonitorLock lock(_sessionDelegate->monitor());
+    _backends.swap(backends);
+  }
+  // What a dashboard of the one before has not acknowledged goes on by itself.
+  if (!backends.has_value()) return;
+  for (const auto& [name, backend] : *backends) backend->cleanup();
 }
 
 void TelvanedSession::updateSessionWithDefaultSessionInfo() {

@@ -57,6 +57,7 @@ Value TelvanedSession::sendMessageToBackends(Dictionary message) {
                   categoryValue.isPresent() ? "type" : "category");
     return {};
   }
+  activateHelperIfEnabledByParent();
   const uint16_t category = categoryValue.low16Bits();
   const uint16_t type = typeValue.low16Bits();
   const uint32_t flag = message[kTelvaneMessageParametersFlag].uint32Value();
@@ -172,6 +173,7 @@ void TelvanedSession::internalFlushMessagesWithCompletion(FlushReply completion)
     if (completion) completion({}, makeTelvaneError(kNoBackends, static_cast<int64_t>(TelvaneErrorCode::Failure)));
     return;
   }
+  activateHelperIfEnabledByParent();
   const auto countdown = std::make_shared<FlushCountdown>(FlushCountdown{_backends->size(), std::move(completion)});
   for (const auto& [name, backend] : *_backends) {
     backend->flushMessagesWithCompletion([&log = log(), &shared = _shared, countdown, name = name](

@@ -112,6 +112,7 @@ void TelvanedSession::syncReportingStates() {
     }
     const uint32_t parentState = (*parentBackend)->state();
     backend->setState(parentState);
+    if (parentState == TelvaneBackendStateEnabled && state != parentState) _isEnabledByParent = true;
     backend->setSamplingThreshold((*parentBackend)->samplingThreshold());
     log().message("HTTPSPostBackend(syncReportingStates): {}: state and sampling rate updated to {}, {:.2f}%", name,
                   parentState, static_cast<float>(backend->samplingThreshold().realValue()));

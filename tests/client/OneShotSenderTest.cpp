@@ -111,6 +111,37 @@ TEST_F(OneShotSenderTest, sendsOneAfterAnotherEachOverItsOwnConnection) {
   EXPECT_EQ(daemon().count(Operation::SendMessageWithSessionInfo), 5u);
 }
 
+TEST_F(OneShotSenderTest, waitsForTheAnswerSoThatABurstIsNeverSeveralSessionsAtOnce) {
+  std::vector<ipc::ReplyBlock> kept;
+  daemon().answer(Operation::SendMessageWithSessionInfo,
+                  [&](const ScriptedDaemon::Call&, ipc::ReplyBlock reply) { kept.push_back(std::move(reply)); });
+  constexpr size_t kBurst = 12;
+  for (size_t i = 0; i < kBurst; ++i) EXPECT_TRUE(send(sessionInfo()));
+  for (size_t i = 0; i < kBurst; ++i) {
+    run();
+    ASSERT_EQ(kept.size(), i + 1);
+    kept.back()(Array{"finished"});
+  }
+  run();
+  EXPECT_EQ(daemon().endedConnectionCount(), kBurst);
+}
+
+TEST_F(OneShotSenderTest, anAnswerThatTakesLongHoldsUpTheOthersForTenSecondsOnly) {
+  std::vector<ipc::ReplyBlock> kept;
+  daemon().answer(Operation::SendMessageWithSessionInfo,
+                  [&](const ScriptedDaemon::Call&, ipc::ReplyBlock reply) { kept.push_back(std::move(reply)); });
+  EXPECT_TRUE(send(sessionInfo()));
+  EXPECT_TRUE(send(sessionInfo()));
+  run();
+  _world.advance(std::chrono::seconds(9));
+  EXPECT_EQ(kept.size(), 1u);
+  _world.advance(std::chrono::seconds(2));
+  EXPECT_EQ(kept.size(), 2u);
+  for (ipc::ReplyBlock& reply : kept) reply(Array{"finished"});
+  run();
+  EXPECT_EQ(daemon().endedConnectionCount(), 2u);
+}
+
 TEST_F(OneShotSenderTest, logsAnAnswerThatIsNoTextAsAbsent) {
   for (const Value& status : {Value(), Value(7)}) {
     daemon().answer(Operation::SendMessageWithSessionInfo, Array{status});
