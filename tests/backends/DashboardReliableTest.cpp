@@ -351,6 +351,7 @@ TEST_F(DashboardReliableTest, takesCleanupMoreThanOnce) {
 
 TEST_F(DashboardReliableTest, sendsNothingOnceItIsCleanedUp) {
   backend().cleanup();
+  _world.runUntilIdle();
   EXPECT_TRUE(send({}).has_value()) << "the line is the client's";
   expectSilence();
   EXPECT_EQ(arrivals(), 0u);
@@ -385,11 +386,9 @@ TEST_F(DashboardReliableTest, isTheSameInEveryRunAndOrder) {
   sendMany(40);
   tick(kMoreThanTheSchedule);
   for (uint16_t eventID = 1; eventID <= 40; ++eventID) {
-    EXPECT_EQ(periodsOf(eventID).size(), eventID % 3 == 0  ? 5u
-                                         : eventID % 5 < 2 ? 1u
-                                         : eventID % 5 < 5 ? 2u
-                                                           : 0u)
-        << eventID;
+    // Of those that are acknowledged, what takes up to two periods comes before the first repetition.
+    const size_t expected = eventID % 3 == 0 ? 5 : eventID % 5 <= 2 ? 1 : 2;
+    EXPECT_EQ(periodsOf(eventID).size(), expected) << eventID;
   }
 }
 
