@@ -2,8 +2,11 @@
 
 #include <chrono>
 #include <cstdint>
+#include <optional>
 #include <string>
 #include <variant>
+
+#include "platform/IPv4SocketAddress.h"
 
 namespace telvane {
 
@@ -16,6 +19,13 @@ struct CollectorOptions {
   std::string storebagFolder;
   // One JSON line per event; empty: events are counted and dropped.
   std::string eventFile;
+  // Gets what is uploaded; empty: uploads are refused.
+  std::string uploadFolder;
+  // Where dashboard datagrams are taken, if at all; port 0 picks one.
+  std::optional<IPv4SocketAddress> dashboard;
+  // How many of a hundred of them, and of their acknowledgements, are dropped by chance from the seed.
+  unsigned dashboardLossPercent = 0;
+  uint64_t dashboardLossSeed = 0;
   // How long clients may keep a storebag.
   std::chrono::seconds maxAge{3600};
 };

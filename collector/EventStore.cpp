@@ -57,6 +57,13 @@ HTTPServer::Response EventStore::take(const HTTPServer::Request& request) {
   return {200, {{"Content-Type", "application/json"}}, Data::copyOf("{}")};
 }
 
+Result<void> EventStore::add(const Dictionary& line) {
+  if (_file == nullptr) return {};
+  std::string text;
+  if (Result<void> written = json::append(line, json::Style::Compact, text); written.has_error()) return written;
+  return _file->append(text + '\n');
+}
+
 Result<uint64_t> EventStore::store(const HTTPServer::Request& request, std::string_view json) {
   if (_file == nullptr) return countMarks(json);
   const Result<Value> body = json::parse(json, {.maximumBytes = kMaximumBodyBytes});

@@ -5,6 +5,7 @@
 #include <memory>
 
 #include "foundation/Error.h"
+#include "foundation/Value.h"
 #include "platform/system/AppendFile.h"
 #include "platform/url/HTTPServer.h"
 
@@ -20,6 +21,8 @@ class EventStore {
   // Takes the body of one post (gzip when Content-Encoding says so) and answers 200, 400 with the reason when it is no
   // batch of events, 500 when it could not be stored.
   HTTPServer::Response take(const HTTPServer::Request& request);
+  // Writes one line that somebody else made of an event, and counts nothing.
+  Result<void> add(const Dictionary& line);
 
   uint64_t events() const noexcept { return _events; }
   uint64_t posts() const noexcept { return _posts; }
