@@ -406,6 +406,32 @@ TEST_F(SimulatedSchedulerTest, overtakesACallerAtItsCallsWhenToldTo) {
   EXPECT_THAT(stories, ElementsAre("caller;job;", "job;caller;"));
 }
 
+// What a job holds may call out when it goes, and its strand is still in use then.
+TEST_F(SimulatedSchedulerTest, overtakesAJobThatIsBeingDestroyed) {
+  bool isOvertaken = false;
+  for (uint64_t seed = 1; seed <= 20; ++seed) {
+    SimulatedScheduler scheduler(seed);
+    scheduler.setInterleaving(SimulatedScheduler::Interleaving::AtCalls);
+    SimulatedDispatch dispatch(scheduler, "app");
+    const auto semaphore = dispatch.newSemaphore(0);
+    std::string story;
+    {
+      std::shared_ptr<int> held(new int(0), [&story, semaphore](int* number) {
+        const std::unique_ptr<int> owned(number);
+        story += "begin;";
+        for (int i = 0; i < 3; ++i) semaphore->signal();
+        story += "end;";
+      });
+      dispatch.spawn("held", [held = std::move(held)] {});
+    }
+    for (int i = 0; i < 3; ++i) dispatch.spawn("other", [&story] { story += "other;"; });
+    scheduler.runUntilIdle();
+    EXPECT_EQ(story.size(), std::string("begin;end;other;other;other;").size()) << story;
+    isOvertaken = isOvertaken || story.find("begin;end;") == std::string::npos;
+  }
+  EXPECT_TRUE(isOvertaken);
+}
+
 using SimulatedSchedulerDeathTest = SimulatedSchedulerTest;
 
 TEST_F(SimulatedSchedulerDeathTest, endsTheProcessWhenAnotherThreadReachesIt) {

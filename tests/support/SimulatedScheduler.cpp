@@ -32,6 +32,7 @@ class SimulatedStrand {
   bool isEnding = false;
   bool isRunnable = false;
   bool isClearing = false;  // its job is over and being destroyed
+  bool isDone = false;      // and is gone
   bool isReleased = false;  // the fiber is to return instead of waiting for another job
   std::unique_ptr<Fiber> fiber;
 };
@@ -240,7 +241,7 @@ void SimulatedScheduler::enter(SimulatedStrand& strand) {
   SimulatedStrand* before = std::exchange(_current, &strand);
   strand.fiber->enter();
   _current = before;
-  if (!strand.job) retire(strand);
+  if (strand.isDone) retire(strand);
 }
 
 void SimulatedScheduler::runStrand(SimulatedStrand& strand) {
@@ -252,7 +253,8 @@ void SimulatedScheduler::runStrand(SimulatedStrand& strand) {
       if (!_failure) _failure = std::current_exception();
     }
     strand.isClearing = true;
-    strand.job = nullptr;
+    strand.job = nullptr;  // may give way, too
+    strand.isDone = true;
     strand.fiber->leave();
   }
 }
@@ -260,6 +262,7 @@ void SimulatedScheduler::runStrand(SimulatedStrand& strand) {
 void SimulatedScheduler::retire(SimulatedStrand& strand) {
   strand.isEnding = false;
   strand.isClearing = false;
+  strand.isDone = false;
   const auto found =
       std::find_if(_strands.begin(), _strands.end(), [&strand](const auto& other) { return other.get() == &strand; });
   _idleStrands.push_back(std::move(*found));
