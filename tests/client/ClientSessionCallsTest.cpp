@@ -1,7 +1,9 @@
 #include <cstdio>
+#include <filesystem>
 #include <stdexcept>
 
 #include "client/ClientSession.h"
+#include "interfaces/FileURL.h"
 #include "tests/client/ClientFixture.h"
 #include "tests/support/ScratchFolder.h"
 
@@ -187,6 +189,23 @@ TEST_F(ClientSessionCallsTest, doesNotCallTheCompletionOfAnUploadThatIsLost) {
   daemon().dropReplies();
   run();
   EXPECT_FALSE(isCalled);
+}
+
+TEST_F(ClientSessionCallsTest, tellsTheDaemonThePathWithoutLinksInItsFoldersButWithOneAtItsEnd) {
+  const auto session = open();
+  daemon().answer(Operation::UploadFileAtPath, Array{true});
+  const std::string file = _folder.write("folder/a.log", "x");
+  std::filesystem::create_directory_symlink(_folder.at("folder"), _folder.at("way"));
+  std::filesystem::create_symlink(file, _folder.at("link"));
+  const auto told = [&](const std::string& path) {
+    EXPECT_TRUE(session->uploadFileWithURL(path));
+    run();
+    return pathOfFileURL(daemon().last(Operation::UploadFileAtPath).arguments[0].text());
+  };
+  EXPECT_EQ(told(_folder.at("way/a.log")), file);
+  EXPECT_EQ(told(_folder.at("folder/../way//a.log")), file);
+  EXPECT_EQ(told(std::filesystem::relative(file).string()), file);
+  EXPECT_EQ(told(_folder.at("link")), _folder.at("link"));
 }
 
 TEST_F(ClientSessionCallsTest, uploadsLogData) {

@@ -1,5 +1,7 @@
 #include "tests/daemon/DaemonClient.h"
 
+#include <fcntl.h>
+
 #include "interfaces/SessionKeys.h"
 
 namespace telvane::testing {
@@ -26,10 +28,10 @@ void DaemonClient::tell(Operation operation, Array arguments) {
   _world.runUntilIdle();
 }
 
-std::shared_ptr<Answer> DaemonClient::askInPassing(Operation operation, Array arguments) {
+std::shared_ptr<Answer> DaemonClient::askInPassing(Operation operation, Array arguments, int descriptor) {
   const auto answer = std::make_shared<Answer>();
   _connection->sendWithReply(
-      {static_cast<uint16_t>(operation), std::move(arguments), {}},
+      {static_cast<uint16_t>(operation), std::move(arguments), ipc::Descriptor(descriptor)},
       [answer](Array values) { answer->values = std::move(values); },
       [answer](const Error& error) { answer->error = error; });
   return answer;
@@ -37,6 +39,16 @@ std::shared_ptr<Answer> DaemonClient::askInPassing(Operation operation, Array ar
 
 Answer DaemonClient::ask(Operation operation, Array arguments) {
   const auto answer = askInPassing(operation, std::move(arguments));
+  _world.runUntilIdle();
+  return *answer;
+}
+
+std::shared_ptr<Answer> DaemonClient::uploadInPassing(const std::string& fileURL, const ExtensionToken& token) {
+  return askInPassing(Operation::UploadFileAtPath, {fileURL}, ::fcntl(token.descriptor, F_DUPFD_CLOEXEC, 0));
+}
+
+Answer DaemonClient::upload(const std::string& fileURL, const ExtensionToken& token) {
+  const auto answer = uploadInPassing(fileURL, token);
   _world.runUntilIdle();
   return *answer;
 }

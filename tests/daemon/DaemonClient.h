@@ -28,8 +28,11 @@ class DaemonClient {
 
   void tell(Operation operation, Array arguments);
   Answer ask(Operation operation, Array arguments = {});
-  // The same without waiting for anything.
-  std::shared_ptr<Answer> askInPassing(Operation operation, Array arguments = {});
+  // The same without waiting for anything. descriptor: goes along with the call, or -1.
+  std::shared_ptr<Answer> askInPassing(Operation operation, Array arguments = {}, int descriptor = -1);
+  // Hands a file over. token: of the daemon's SandboxExtensions.
+  Answer upload(const std::string& fileURL, const ExtensionToken& token);
+  std::shared_ptr<Answer> uploadInPassing(const std::string& fileURL, const ExtensionToken& token);
 
   void setSessionInfo(Value sessionInfo, Value userInfo = {}, bool hasAggregationBlock = false) {
     tell(Operation::SetSessionInfo, {std::move(sessionInfo), std::move(userInfo), Value(), hasAggregationBlock});

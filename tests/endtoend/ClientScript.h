@@ -31,6 +31,9 @@ class ClientScript {
   ClientScript& sendMany(uint16_t category, const std::string& from, int count, int first = 0, int textSize = 0);
   // "flushed: ok", or "flushed: error CODE TEXT".
   ClientScript& flush();
+  // Uploads the file: "handed over: yes" or "no" when the call returns, and for a yes "uploaded: yes" or "no" when the
+  // daemon has answered.
+  ClientScript& upload(const std::string& path);
   ClientScript& share(Dictionary sharedData);
   ClientScript& setDigestKey(const std::string& key, int32_t algorithm = 0);
   ClientScript& sendOneShot(Dictionary sessionInfo, Value userInfo, uint16_t category, uint16_t type, Value payload);
@@ -55,6 +58,7 @@ class ClientScript {
   static constexpr char kFrom[] = "from";
   static constexpr char kCount[] = "count";
   static constexpr char kFirst[] = "first";
+  static constexpr char kPath[] = "path";
   static constexpr char kTextSize[] = "textSize";
 
  private:

@@ -1,6 +1,8 @@
 #include "tests/endtoend/Instance.h"
 
 #include <signal.h>
+#include <sys/stat.h>
+#include <unistd.h>
 
 #include <chrono>
 #include <filesystem>
@@ -133,8 +135,26 @@ void Instance::launchDaemon(const std::vector<std::string>& options) {
 void Instance::startDaemon(const std::vector<std::string>& options) {
   const size_t before = daemonLog().size();
   launchDaemon(options);
-  eventually([this, before] {
-    return !_daemon->isRunning() || daemonLog().find("Listener resumes", before) != std::string::npos;
+  waitForDaemon(before);
+}
+
+void Instance::startDaemonAs(uid_t user, const std::vector<std::string>& options) {
+  for (const char* folder : {"root", "home"}) {
+    std::filesystem::create_directories(path(folder));
+    for (const auto& entry : std::filesystem::recursive_directory_iterator(path(folder))) {
+      if (::chown(entry.path().c_str(), user, user) != 0) throw std::runtime_error("chown needs root");
+    }
+    if (::chown(path(folder).c_str(), user, user) != 0) throw std::runtime_error("chown needs root");
+  }
+  const size_t before = daemonLog().size();
+  _daemon.reset();
+  _daemon = startProgramAs(user, "telvaned", options, "daemon");
+  waitForDaemon(before);
+}
+
+void Instance::waitForDaemon(size_t logSizeBefore) {
+  eventually([this, logSizeBefore] {
+    return !_daemon->isRunning() || daemonLog().find("Listener resumes", logSizeBefore) != std::string::npos;
   });
 }
 
@@ -149,6 +169,18 @@ std::unique_ptr<ChildProcess> Instance::startProgram(const std::string& programN
                                                      const std::vector<std::string>& arguments,
                                                      const std::string& outputName) {
   std::vector<std::string> all{program(programName)};
+  all.insert(all.end(), arguments.begin(), arguments.end());
+  return std::make_unique<ChildProcess>(all, environment(),
+                                        ChildProcess::Files{path(outputName + ".out"), path(outputName + ".err")});
+}
+
+std::unique_ptr<ChildProcess> Instance::startProgramAs(uid_t user, const std::string& programName,
+                                                       const std::vector<std::string>& arguments,
+                                                       const std::string& outputName) {
+  ::chmod(_scratch.path().c_str(), 0755);
+  const std::string name = std::to_string(user);
+  std::vector<std::string> all{"/usr/bin/setpriv", "--reuid=" + name, "--regid=" + name, "--clear-groups",
+                               program(programName)};
   all.insert(all.end(), arguments.begin(), arguments.end());
   return std::make_unique<ChildProcess>(all, environment(),
                                         ChildProcess::Files{path(outputName + ".out"), path(outputName + ".err")});

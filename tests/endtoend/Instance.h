@@ -1,5 +1,7 @@
 #pragma once
 
+#include <sys/types.h>
+
 #include <functional>
 #include <memory>
 #include <string>
@@ -58,6 +60,14 @@ class Instance {
   std::unique_ptr<ChildProcess> startProgram(const std::string& programName, const std::vector<std::string>& arguments,
                                              const std::string& outputName);
 
+  // The same as another user, in no other group than its own. REQUIRES: root. The folders above the instance let
+  // everybody through from then on.
+  std::unique_ptr<ChildProcess> startProgramAs(uid_t user, const std::string& programName,
+                                               const std::vector<std::string>& arguments,
+                                               const std::string& outputName);
+  // Starts the daemon as another user, to whom the instance's folders are given, and returns when it serves.
+  void startDaemonAs(uid_t user, const std::vector<std::string>& options = {"--log-level", "info"});
+
   std::string collectorURL(const std::string& path) const { return "https://" + _collectorAddress + path; }
   // What has arrived so far: one line per event, as the collector writes it.
   std::vector<Dictionary> arrived() const;
@@ -70,6 +80,7 @@ class Instance {
 
  private:
   std::vector<std::string> environment() const;
+  void waitForDaemon(size_t logSizeBefore);
   void writeBundle();
 
   ScratchFolder _scratch;

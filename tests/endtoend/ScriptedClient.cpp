@@ -98,6 +98,7 @@ class Runner {
         {"oneShot", &Runner::oneShot},   {"setDigestKey", &Runner::setDigestKey},
         {"wait", &Runner::waitForInput}, {"openAggregating", &Runner::openAggregating},
         {"letGo", &Runner::letGo},       {"sendMany", &Runner::sendMany},
+        {"upload", &Runner::upload},
     };
     (this->*kMethods.at(std::string(step[ClientScript::kStep].text())))(step);
   }
@@ -179,6 +180,18 @@ class Runner {
         answer(error.has_value() ? "error " + std::to_string(error->code()) + " " + error->description() : "ok");
       });
     });
+  }
+
+  void upload(const Dictionary& step) {
+    auto answered = std::make_shared<std::promise<bool>>();
+    const bool isHandedOver = session()->uploadFileWithURL(
+        String(step[ClientScript::kPath].text()),
+        [answered](bool isSuccess, const std::optional<Error>&) { answered->set_value(isSuccess); });
+    sayLine(isHandedOver ? "handed over: yes" : "handed over: no");
+    if (!isHandedOver) return;
+    std::future<bool> answer = answered->get_future();
+    const bool hasCome = answer.wait_for(kPatience) == std::future_status::ready;
+    sayLine(std::string("uploaded: ") + (!hasCome ? "no answer" : answer.get() ? "yes" : "no"));
   }
 
   void share(const Dictionary& step) {

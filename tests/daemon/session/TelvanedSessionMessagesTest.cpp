@@ -187,6 +187,62 @@ TEST_F(TelvanedSessionMessagesTest, uploadsThatNoBackendTakesFail) {
   EXPECT_TRUE(hasLine(log(), "uploadFileAtPath: Uploading file for session 42"));
 }
 
+// A bag with an upload server beside the collector, and what the server says.
+class TelvanedSessionUploadTest : public TelvanedSessionMessagesTest {
+ protected:
+  static constexpr char kUploadURL[] = "https://uploads.example/upload";
+  TelvanedSessionUploadTest() {
+    Dictionary section = sectionOf({{"splunk", StorebagBuilder::permissiveClient()}});
+    section.set(kTelvaneBackendUploadServer, Dictionary{{kProfilePostURL, kUploadURL}});
+    givenSection(section);
+    givenAnswer("success");
+    process.files().place("/tmp/a log", "one line");
+  }
+  void givenAnswer(const std::string& text) { world.network().answer(kUploadURL, NetworkAnswer::ok(text)); }
+  ExtensionToken token() { return process.sandboxExtensions().newToken("/tmp/a log"); }
+};
+
+TEST_F(TelvanedSessionUploadTest, theFileGoesToTheUploadServerAndTheClientHearsOfIt) {
+  const auto client = startSession();
+  EXPECT_EQ(client->upload("file:///tmp/a%20log", token())[0], Value(true));
+  EXPECT_TRUE(hasLine(log(), "uploadFileAtPath: Uploading file for session 42"));
+  EXPECT_TRUE(hasLine(log(), "uploadFileWithURL: File upload successful for /tmp/a log"));
+  const auto requests = world.network().requestsTo(kUploadURL);
+  ASSERT_EQ(requests.size(), 1u);
+  EXPECT_THAT(requests[0].request.url, ::testing::HasSubstr("&filename=a%20log.gz&raw=true"));
+  EXPECT_EQ(RecordingConnectivity::bodyText(requests[0].request), "one line");
+  EXPECT_TRUE(requests[0].isUpload);
+  EXPECT_FALSE(process.files().exists("/tmp/a log"));
+}
+
+TEST_F(TelvanedSessionUploadTest, aServerThatDoesNotSaySuccessKeepsTheFileAndTheClientHearsNothingOfIt) {
+  givenAnswer("no room");
+  const auto client = startSession();
+  EXPECT_EQ(client->upload("file:///tmp/a%20log", token())[0], Value(true));
+  EXPECT_TRUE(process.files().exists("/tmp/a log"));
+}
+
+TEST_F(TelvanedSessionUploadTest, aFileWithoutATokenIsRefused) {
+  const auto client = startSession();
+  log().expectError("UploadBackend(uploadFileAtPath): Only upload a regular file.");
+  log().expectError("uploadFileWithURL: File upload failed for /tmp/a log");
+  EXPECT_EQ(client->upload("file:///tmp/a%20log", ExtensionToken())[0], Value(false));
+  EXPECT_EQ(world.network().countTo(kUploadURL), 0u);
+}
+
+TEST_F(TelvanedSessionUploadTest, otherSessionsGoOnWhileOneWaitsForItsServer) {
+  world.network().answer(kUploadURL, NetworkAnswer::ok().after(std::chrono::seconds(50)));
+  const auto waiting = startSession();
+  const auto other = startSession(sessionInfo(kClientType, 43));
+  const auto upload = waiting->uploadInPassing("file:///tmp/a%20log", token());
+  world.runUntilIdle();
+  EXPECT_FALSE(upload->values.has_value());
+  EXPECT_TRUE(other->send(7).values.has_value());
+  EXPECT_EQ(errorOf(other->flush()).code(), 0);
+  world.advance(std::chrono::seconds(51));
+  EXPECT_EQ((*upload)[0], Value(true));
+}
+
 TEST_F(TelvanedSessionMessagesTest, anUploadIsOfThePathThatTheURLNames) {
   const auto client = openSession();
   for (const char* url : {"file:///tmp/a%20log", "file://localhost/tmp/a%20log", "file:///tmp/a%20log?x#y"}) {

@@ -4,6 +4,7 @@
 #include <cerrno>
 #include <cstdio>
 
+#include "platform/system/UnnamedFile.h"
 #include "tests/platform/url/Peers.h"
 #include "tests/platform/url/URLSessionFixture.h"
 
@@ -347,6 +348,38 @@ TEST_F(CurlURLSessionTest, doesNotCountAFileInTheFlowGate) {
   const std::string path = _folder.write("container", std::string(1000, 'f'));
   const auto task = *session().newUploadTask(post(url(), "x"), path);
   task->resume();
+  EXPECT_EQ(_gate.bytes(), url().size());
+  waitForRequests(1).front()->send({});
+  EXPECT_FALSE(delegate().waitFor(task).error.has_value());
+  EXPECT_EQ(_gate.bytes(), 0u);
+}
+
+TEST_F(CurlURLSessionTest, sendsABodyThatIsAFileWithItsLength) {
+  const auto file = std::shared_ptr(*UnnamedFile::open(_folder.path()));
+  for (int i = 0; i < 100; ++i)
+    ASSERT_TRUE(file->append(std::string(3000, static_cast<char>('a' + i % 26))).has_value());
+  std::string length;
+  _handler = [&length](const Server::Request& request, const std::shared_ptr<Server::Responder>& responder) {
+    length = *request.header("Content-Length");
+    responder->send({.body = request.body});
+  };
+  URLRequest request = post(url(), "ignored");
+  request.bodyFile = file;
+  const TaskOutcome outcome = run(std::move(request));
+  EXPECT_EQ(length, "300000");
+  EXPECT_EQ(outcome.body().size(), 300'000u);
+  EXPECT_EQ(outcome.body().substr(298'000, 10), "vvvvvvvvvv");
+  EXPECT_EQ(outcome.sent, 300'000);
+  EXPECT_EQ(file.use_count(), 1) << "let go of when the task has completed";
+}
+
+TEST_F(CurlURLSessionTest, doesNotCountABodyThatIsAFileInTheFlowGate) {
+  givenAnswersByTheTest();
+  URLRequest request = post(url(), "x");
+  const auto file = std::shared_ptr(*UnnamedFile::open(_folder.path()));
+  ASSERT_TRUE(file->append(std::string(1000, 'f')).has_value());
+  request.bodyFile = file;
+  const auto task = start(std::move(request));
   EXPECT_EQ(_gate.bytes(), url().size());
   waitForRequests(1).front()->send({});
   EXPECT_FALSE(delegate().waitFor(task).error.has_value());

@@ -3,6 +3,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <chrono>
 #include <thread>
 
@@ -92,6 +93,95 @@ TEST_F(HTTPServerTest, refusesATooLargeBody) {
               StartsWith("HTTP/1.1 413 "));
   EXPECT_THAT(answerTo("POST / HTTP/1.1\r\nConnection: close\r\nContent-Length: 10\r\n\r\nxxxxxxxxxx"),
               StartsWith("HTTP/1.1 200 "));
+}
+
+// Keeps the pieces of a body, and refuses at a byte of the test's choice.
+class KeepingSink final : public HTTPServer::BodySink {
+ public:
+  explicit KeepingSink(int* alive) : _alive(alive) { ++*_alive; }
+  ~KeepingSink() override { --*_alive; }
+  int take(std::string_view piece) override {
+    bytes += piece;
+    largestPiece = std::max(largestPiece, piece.size());
+    return piece.find('!') == std::string_view::npos ? 0 : 507;
+  }
+  std::string bytes;
+  size_t largestPiece = 0;
+
+ private:
+  int* const _alive;
+};
+
+// Bodies for /sink go to a sink, those for other paths are gathered.
+class HTTPServerSinkTest : public HTTPServerTest {
+ protected:
+  HTTPServerSinkTest() {
+    _serverOptions.maximumBodyBytes = 10;
+    _sinkMaker = [this](const Server::Request& head) -> std::shared_ptr<Server::BodySink> {
+      return head.target == "/sink" ? std::make_shared<KeepingSink>(&_aliveSinks) : nullptr;
+    };
+    _handler = [](const Server::Request& request, const std::shared_ptr<Server::Responder>& responder) {
+      const auto sink = std::dynamic_pointer_cast<KeepingSink>(request.sink);
+      const std::string taken = sink != nullptr ? sink->bytes : "nothing";
+      const size_t largest = sink != nullptr ? sink->largestPiece : 0;
+      responder->send({.headers = {{"Largest", std::to_string(largest)}},
+                       .body = Data(taken + "|" + std::string(request.body.view()))});
+    };
+  }
+  int _aliveSinks = 0;  // read when the server has ended
+};
+
+TEST_F(HTTPServerSinkTest, takesABodyOfAnySizeInPieces) {
+  const std::string content(1'000'000, 'x');
+  const std::string answer =
+      answerTo("POST /sink HTTP/1.1\r\nConnection: close\r\nContent-Length: 1000000\r\n\r\n" + content);
+  EXPECT_EQ(body(answer), content + "|");
+  const size_t at = answer.find("Largest: ");
+  ASSERT_NE(at, std::string::npos);
+  EXPECT_LE(std::stoul(answer.substr(at + 9)), 64u << 10);
+}
+
+TEST_F(HTTPServerSinkTest, takesChunksAndABodyThatIsHeldBack) {
+  EXPECT_EQ(body(answerTo("POST /sink HTTP/1.1\r\nConnection: close\r\nTransfer-Encoding: chunked\r\n\r\n"
+                          "c\r\nabcdefghijkl\r\n2\r\nmn\r\n0\r\n\r\n")),
+            "abcdefghijklmn|");
+  const RawPeer peer = connect();
+  peer.say("POST /sink HTTP/1.1\r\nConnection: close\r\nExpect: 100-continue\r\nContent-Length: 2\r\n\r\n");
+  EXPECT_EQ(peer.hearUntil("\r\n\r\n"), "HTTP/1.1 100 Continue\r\n\r\n");
+  peer.say("ok");
+  EXPECT_THAT(peer.hearAll(), ::testing::EndsWith("ok|"));
+}
+
+TEST_F(HTTPServerSinkTest, goesOnWithTheNextRequestOfTheConnection) {
+  const std::string both = answerTo(
+      "POST /sink HTTP/1.1\r\nContent-Length: 12\r\n\r\nfirst of allPOST /other HTTP/1.1\r\nConnection: close\r\n"
+      "Content-Length: 3\r\n\r\ntwo");
+  EXPECT_THAT(both, HasSubstr("first of all|"));
+  EXPECT_THAT(both, ::testing::EndsWith("nothing|two"));
+}
+
+TEST_F(HTTPServerSinkTest, gathersWhatNoSinkTakesAndBoundsIt) {
+  EXPECT_THAT(answerTo("POST /other HTTP/1.1\r\nContent-Length: 11\r\n\r\nxxxxxxxxxxx"), StartsWith("HTTP/1.1 413 "));
+  EXPECT_THAT(answerTo("POST /other HTTP/1.1\r\nTransfer-Encoding: chunked\r\n\r\nb\r\nxxxxxxxxxxx\r\n0\r\n\r\n"),
+              StartsWith("HTTP/1.1 413 "));
+}
+
+TEST_F(HTTPServerSinkTest, asksNobodyForARequestWithoutABody) {
+  EXPECT_EQ(body(answerTo("POST /sink HTTP/1.1\r\nConnection: close\r\nContent-Length: 0\r\n\r\n")), "nothing|");
+}
+
+TEST_F(HTTPServerSinkTest, endsTheConnectionWithTheStatusOfASinkThatRefuses) {
+  EXPECT_THAT(answerTo("POST /sink HTTP/1.1\r\nContent-Length: 14\r\n\r\nno more of it!"), StartsWith("HTTP/1.1 507 "));
+}
+
+TEST_F(HTTPServerSinkTest, letsASinkGoWhoseBodyDoesNotComeToItsEnd) {
+  {
+    const RawPeer peer = connect();
+    peer.say("POST /sink HTTP/1.1\r\nContent-Length: 1000\r\n\r\nhalf");
+  }
+  EXPECT_EQ(body(answerTo("POST /other HTTP/1.1\r\nConnection: close\r\n\r\n")), "nothing|");
+  endServer();
+  EXPECT_EQ(_aliveSinks, 0);
 }
 
 TEST_F(HTTPServerTest, refusesATooLargeHead) {

@@ -31,7 +31,7 @@ HTTPServer& URLSessionFixture::server() {
       _requestCame.notify_all();
     };
   }
-  auto started = Server::start(_serverOptions, std::move(handler));
+  auto started = Server::start(_serverOptions, std::move(handler), _sinkMaker);
   if (!started) throw std::runtime_error(started.error().description());
   _server = std::move(*started);
   return *_server;

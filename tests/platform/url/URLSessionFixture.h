@@ -33,6 +33,8 @@ class URLSessionFixture : public ::testing::Test {
   Server& server();
   URLSession& session();
   RecordingURLSessionDelegate& delegate() { return *_delegate; }
+  // Ends the server and all that it held.
+  void endServer() { _server.reset(); }
   void dropSession();
   void dropProvider();
   // https://localhost:PORT/path, or http:// when the server has no certificate.
@@ -53,6 +55,7 @@ class URLSessionFixture : public ::testing::Test {
   Server::Options _serverOptions;
   // Empty: the request is kept for the test, which answers it.
   Server::Handler _handler;
+  Server::SinkMaker _sinkMaker;
   CurlURLSessionOptions _options;
   URLSessionConfiguration _configuration;
   Dispatch* _sessionDispatch = &_dispatch;
