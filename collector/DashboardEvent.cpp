@@ -112,11 +112,10 @@ Dictionary dashboardFields(std::string_view text) {
   for (size_t equals = nextEquals(text, 0); equals != kNothing; equals = nextEquals(text, equals + 1)) {
     const size_t blank = text.substr(0, equals).rfind(' ');
     const bool hasBlank = blank != kNothing && blank >= valueStart;
-    if (key.has_value()) {
-      const size_t valueEnd = hasBlank ? blank : equals;
-      fields.set(*key, Value(unescaped(text.substr(valueStart, valueEnd - valueStart))));
-    }
-    key = String(text.substr(hasBlank ? blank + 1 : valueStart, equals - (hasBlank ? blank + 1 : valueStart)));
+    const size_t valueEnd = hasBlank ? blank : valueStart;
+    const size_t keyStart = hasBlank ? blank + 1 : valueStart;
+    if (key.has_value()) fields.set(*key, Value(unescaped(text.substr(valueStart, valueEnd - valueStart))));
+    key = String(text.substr(keyStart, equals - keyStart));
     valueStart = equals + 1;
   }
   if (key.has_value()) fields.set(*key, Value(unescaped(text.substr(valueStart))));

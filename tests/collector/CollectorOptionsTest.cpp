@@ -24,7 +24,7 @@ int statusOf(const std::vector<const char*>& arguments) {
 
 TEST(CollectorOptionsTest, readsEveryOption) {
   auto arguments = complete("127.0.0.1:8443");
-  arguments.insert(arguments.end(), {"--max-age", "60"});
+  arguments.insert(arguments.end(), {"--max-age", "60", "--uploads", "u"});
   const auto parsed = parse(arguments);
   const auto* options = std::get_if<CollectorOptions>(&parsed);
   ASSERT_NE(options, nullptr);
@@ -34,6 +34,7 @@ TEST(CollectorOptionsTest, readsEveryOption) {
   EXPECT_EQ(options->privateKeyFile, "k");
   EXPECT_EQ(options->storebagFolder, "s");
   EXPECT_EQ(options->eventFile, "e");
+  EXPECT_EQ(options->uploadFolder, "u");
   EXPECT_EQ(options->maxAge, std::chrono::seconds(60));
 }
 
@@ -70,6 +71,28 @@ TEST(CollectorOptionsTest, refusesWhatItDoesNotKnow) {
   auto negative = complete("127.0.0.1:0");
   negative.insert(negative.end(), {"--max-age", "-1"});
   EXPECT_EQ(statusOf(negative), 2);
+}
+
+TEST(CollectorOptionsTest, takesDashboardDatagramsWhereItIsAskedTo) {
+  const auto with = [](std::vector<const char*> more) {
+    auto arguments = complete("127.0.0.1:0");
+    arguments.insert(arguments.end(), more.begin(), more.end());
+    return arguments;
+  };
+  const auto none = parse(complete("127.0.0.1:0"));
+  EXPECT_EQ(std::get<CollectorOptions>(none).dashboard, std::nullopt);
+  const auto parsed = parse(with({"--dashboard", "127.0.0.1:9000", "--dashboard-loss", "30", "--dashboard-seed", "7"}));
+  const auto* options = std::get_if<CollectorOptions>(&parsed);
+  ASSERT_NE(options, nullptr);
+  EXPECT_EQ(options->dashboard, (IPv4SocketAddress{{127, 0, 0, 1}, 9000}));
+  EXPECT_EQ(options->dashboardLossPercent, 30u);
+  EXPECT_EQ(options->dashboardLossSeed, 7u);
+  for (const char* address : {"", "9000", "localhost:0", "::1:0", "127.0.0.1", "127.0.0.1:65536", "0127.0.0.1:1"}) {
+    EXPECT_EQ(statusOf(with({"--dashboard", address})), 2) << address;
+  }
+  EXPECT_EQ(statusOf(with({"--dashboard", "127.0.0.1:0", "--dashboard-loss", "101"})), 2);
+  EXPECT_EQ(statusOf(with({"--dashboard", "127.0.0.1:0", "--dashboard-loss", "-1"})), 2);
+  EXPECT_EQ(statusOf(with({"--dashboard-loss", "30"})), 2) << "of what?";
 }
 
 TEST(CollectorOptionsTest, hasHelpAndVersion) {

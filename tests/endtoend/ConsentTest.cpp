@@ -1,7 +1,8 @@
-// Nothing leaves this machine without its user's consent, unless the bag overrides it. All roads out of the daemon end
-// in this test: every storebag, every post and every connection at one server, every dashboard datagram at one socket.
-// The daemon's own end is the barrier, since it ends only when everything that it held has left. Each bag is tried
-// twice: with consent the same events do arrive, so a silence is the consent's work and not the bag's.
+// Nothing leaves this machine without its user's consent, unless the bag overrides it or names a dashboard. All roads
+// out of the daemon end in this test: every storebag, every post and every connection at one server, every dashboard
+// datagram at one socket. The daemon's own end is the barrier, since it ends only when everything that it held has
+// left. Each bag is tried twice: with consent the same events do arrive, so a silence is the consent's work and not the
+// bag's.
 #include <arpa/inet.h>
 #include <gmock/gmock.h>
 #include <netinet/in.h>
@@ -47,11 +48,13 @@ class DatagramSocket {
 
   uint16_t port() const { return _port; }
   // Takes what has come so far.
-  size_t takeAll() const {
-    size_t count = 0;
-    char byte = 0;
-    while (recv(_socket, &byte, sizeof byte, MSG_DONTWAIT | MSG_TRUNC) >= 0) ++count;
-    return count;
+  std::vector<std::string> takeAll() const {
+    std::vector<std::string> datagrams;
+    char bytes[2000];
+    for (ssize_t size = 0; (size = recv(_socket, bytes, sizeof bytes, MSG_DONTWAIT)) >= 0;) {
+      datagrams.emplace_back(bytes, static_cast<size_t>(size));
+    }
+    return datagrams;
   }
 
  private:
@@ -90,7 +93,7 @@ class ConsentFixture : public WireFixture {
   void expectNothingHasLeft() {
     EXPECT_EQ(posts().size(), 0u) << posts().front().head << jsonOf(posts().front());
     EXPECT_TRUE(server().strays().empty()) << server().strays().front();
-    EXPECT_EQ(_dashboard.takeAll(), 0u) << "datagrams";
+    EXPECT_THAT(_dashboard.takeAll(), ::testing::IsEmpty());
     std::set<size_t> connections;
     for (const WireRequest& request : server().requests()) {
       EXPECT_THAT(request.head, ::testing::StartsWith("GET /bags/")) << request.head;
@@ -121,7 +124,7 @@ class ConsentFixture : public WireFixture {
 // A bag that does not override consent, as a section over the places where events can go.
 struct Bag {
   const char* name;
-  std::function<Dictionary(const Dictionary& entry, const WireServer& server, uint16_t dashboardPort)> section;
+  std::function<Dictionary(const Dictionary& entry, const WireServer& server)> section;
   size_t backends = 1;
 };
 
@@ -135,7 +138,7 @@ Dictionary sectionOf(std::initializer_list<std::pair<const char*, Array>> backen
 
 // A bag whose only entry has these keys beside those that let everybody report.
 Bag entryWithKeys(const char* name, std::vector<std::pair<Key, Value>> keys) {
-  return {name, [keys = std::move(keys)](Dictionary entry, const WireServer&, uint16_t) {
+  return {name, [keys = std::move(keys)](Dictionary entry, const WireServer&) {
             for (const auto& [key, value] : keys) entry.set(key, value);
             return sectionOf({{"splunk", Array{Value(entry)}}});
           }};
@@ -163,40 +166,31 @@ std::vector<Bag> bagsThatRespectConsent() {
       entryWithKeys("sessionIdInHeader", {{kClientEntryIncludeSessionID, 1}, {kClientEntryUseWiFiOnly, 1}}),
       entryWithKeys("allDevices", {{kClientEntryDeviceWhitelist, Array()}, {kClientEntryDeviceBlacklist, Array()}}),
       {"realtimeURL",
-       [](const Dictionary& entry, const WireServer& server, uint16_t) {
+       [](const Dictionary& entry, const WireServer& server) {
          return sectionOf({{"splunk", Array{Value(with(entry, kClientEntryRealtimePostURL, server.url("/now")))}}});
        }},
       {"severalBackends",
-       [](const Dictionary& entry, const WireServer&, uint16_t) {
+       [](const Dictionary& entry, const WireServer&) {
          const Array entries{Value(entry)};
          return sectionOf({{"splunk", entries}, {"gonzo", entries}, {"qrs", entries}, {"my_splunk_2", entries}});
        },
        4},
-      {"besideADashboard",
-       [](const Dictionary& entry, const WireServer& server, uint16_t dashboardPort) {
-         Dictionary section = sectionOf({{"splunk", Array{Value(entry)}}});
-         section.set("dashboard", Dictionary{{"ip", "127.0.0.1"},
-                                             {"port", dashboardPort},
-                                             {"reliable", 100},
-                                             {"post_url", server.url("/logdata")}});
-         return section;
-       }},
       {"anOverrideInALaterEntry",
-       [](const Dictionary& entry, const WireServer&, uint16_t) {
+       [](const Dictionary& entry, const WireServer&) {
          return sectionOf({{"splunk", Array{Value(entry), Value(with(entry, kClientEntryOverrideDNU, 1))}}});
        }},
       {"anOverrideForAnotherClient",
-       [](const Dictionary& entry, const WireServer&, uint16_t) {
+       [](const Dictionary& entry, const WireServer&) {
          const Dictionary other = with(with(entry, kClientEntryOverrideDNU, 1), kClientEntryClient, "nobody");
          return sectionOf({{"splunk", Array{Value(other), Value(entry)}}});
        }},
       {"anOverrideForANewerVersion",
-       [](const Dictionary& entry, const WireServer&, uint16_t) {
+       [](const Dictionary& entry, const WireServer&) {
          const Dictionary newer = with(with(entry, kClientEntryOverrideDNU, 1), kClientEntryEnabledSince, "99");
          return sectionOf({{"splunk", Array{Value(newer), Value(entry)}}});
        }},
       {"anOverrideBesideTheEntries",
-       [](const Dictionary& entry, const WireServer&, uint16_t) {
+       [](const Dictionary& entry, const WireServer&) {
          Dictionary profile{{kProfileClients, Array{Value(entry)}}};
          profile.set(kClientEntryOverrideDNU, 1);
          Dictionary section{{"splunk", profile}};
@@ -220,7 +214,7 @@ std::vector<Bag> bagsThatRespectConsent() {
 class ConsentOverBagsTest : public ConsentFixture, public ::testing::WithParamInterface<Bag> {};
 
 TEST_P(ConsentOverBagsTest, isNeededForAnyEventToLeave) {
-  givenSection(GetParam().section(clientEntry(), server(), dashboard().port()));
+  givenSection(GetParam().section(clientEntry(), server()));
   const std::string silent = runToTheEnd();
   expectNothingHasLeft();
   EXPECT_THAT(silent, HasSubstr("configured: []"));
@@ -239,7 +233,7 @@ INSTANTIATE_TEST_SUITE_P(Bags, ConsentOverBagsTest, ::testing::ValuesIn(bagsThat
 class ConsentOverriddenTest : public ConsentFixture, public ::testing::WithParamInterface<Bag> {};
 
 TEST_P(ConsentOverriddenTest, isNotNeededAndTheCollectorIsToldSo) {
-  givenSection(GetParam().section(clientEntry(), server(), dashboard().port()));
+  givenSection(GetParam().section(clientEntry(), server()));
   EXPECT_THAT(runToTheEnd(), HasSubstr("configured: [splunk]"));
   expectEverythingHasArrived();
   for (const Dictionary& event : arrived(0)) {
@@ -385,7 +379,32 @@ TEST_F(ConsentTest, isNeededAgainWhenTheUserInfoLeavesTheEntryThatOverrides) {
   EXPECT_EQ(flagsArrived(kOneShot).size(), 1u);
 }
 
-// The exception, so that nobody takes it for an accident.
+// A dashboard gets everything that it is named for, whatever the user says; the collector beside it gets nothing.
+TEST_F(ConsentTest, isNotAskedForByADashboardButStillByTheCollectorBesideIt) {
+  Dictionary besideADashboard = sectionOf({{"splunk", Array{Value(clientEntry())}}});
+  besideADashboard.set("dashboard", Dictionary{{kProfileIP, "127.0.0.1"}, {kProfilePort, dashboard().port()}});
+  givenSection(besideADashboard);
+  const std::string told = runToTheEnd();
+  EXPECT_THAT(told, HasSubstr("configured: [dashboard]"));
+  EXPECT_THAT(told, Not(HasSubstr("splunk")));
+  const std::vector<std::string> datagrams = dashboard().takeAll();
+  std::multiset<std::string> texts;
+  for (const std::string& datagram : datagrams) {
+    ASSERT_GE(datagram.size(), 64u);
+    texts.insert(datagram.substr(64));
+  }
+  // Under two names from two sessions.
+  for (const uint32_t flag : kFlags) EXPECT_EQ(texts.count(" flag=" + std::to_string(flag)), 4u) << flag;
+  EXPECT_EQ(texts.count(" flag=-1"), 1u) << "the one-shot";
+  expectNothingHasLeft();  // to the collector, that is
+
+  givenConsent(true);
+  EXPECT_THAT(runToTheEnd(), HasSubstr("splunk"));
+  expectEverythingHasArrived();
+  EXPECT_EQ(dashboard().takeAll().size(), datagrams.size()) << "as many as without consent";
+}
+
+// Another exception, so that nobody takes it for an accident.
 TEST_F(ConsentTest, isNotAskedForBySessionsThatRequireNoUserInfo) {
   givenSection(section("splunk", Array{Value(clientEntry())}));
   Dictionary info = sessionInfo();
