@@ -4,6 +4,7 @@
 #include <unistd.h>
 
 #include <array>
+#include <chrono>
 #include <cstdlib>
 #include <memory>
 #include <set>
@@ -199,6 +200,87 @@ TEST_F(ClientProcessTest, letsItsHostExitInABlock) {
 TEST_F(ClientProcessTest, staysLoadedWhenItIsUnloaded) {
   givenDaemon();
   expectQuietSuccess("unloadTheLibrary");
+}
+
+TEST_F(ClientProcessTest, leavesWithARunningTimer) {
+  givenDaemon();
+  expectQuietSuccess("leaveWithARunningTimer");
+  ASSERT_TRUE(script().waitForEndedConnections(1));
+  EXPECT_GE(numbers().size(), 1u) << "the first report is out for long";
+  EXPECT_EQ(numbers(), upTo(static_cast<int64_t>(numbers().size())));
+}
+
+TEST_F(ClientProcessTest, endsTheTimerOfASessionThatIsLetGo) {
+  givenDaemon();
+  expectQuietSuccess("releaseWithARunningTimer");
+  ASSERT_TRUE(script().waitForEndedConnections(2));
+  EXPECT_EQ(numbers(), upTo(1));
+  EXPECT_EQ(script().count(Operation::FinishSessionGracefully), 2u);
+}
+
+TEST_F(ClientProcessTest, leavesWithAStuckBlock) {
+  givenDaemon();
+  const auto begin = std::chrono::steady_clock::now();
+  expectQuietSuccess("leaveWithAStuckBlock");
+  EXPECT_LT(std::chrono::steady_clock::now() - begin, std::chrono::seconds(20));
+}
+
+TEST_F(ClientProcessTest, survivesModulesThatThrow) {
+  givenDaemon();
+  expectQuietSuccess("throwInModules");
+  EXPECT_GE(numbers().size(), 1u);
+}
+
+TEST_F(ClientProcessTest, givesAForkedChildPeriodicTasksOfItsOwn) {
+  if (!kMayForkWithThreads) GTEST_SKIP();
+  givenDaemon();
+  expectQuietSuccess("forkWithATimer");
+  EXPECT_EQ(script().connectionCount(), 2u);
+}
+
+TEST_F(ClientProcessTest, theExampleReportsTheMetricsOfItsProcess) {
+  givenDaemon();
+  const Outcome outcome = runProgram({TELVANE_PROGRAM_DIR "/report-metrics", "--seconds", "2"},
+                                     {"TELVANE_ROOT=" + _root.path(), "HOME=" + _root.path()});
+  EXPECT_EQ(outcome.status, 0) << outcome.output;
+  // Two, unless the machine was too busy for the second one.
+  ASSERT_FALSE(categories().empty()) << outcome.output;
+  const std::string made = "made " + std::to_string(categories().size()) + " reports, flushed";
+  EXPECT_NE(outcome.output.find(made), std::string::npos) << outcome.output;
+  EXPECT_EQ(categories().front(), 20);
+  const Dictionary event = *script().last(Operation::SendMessageWithDictionary).arguments[0].dictionary();
+  EXPECT_EQ(event[kTelvaneMessageParametersFlag], Value(1));
+  const Dictionary payload = *event[kTelvaneMessageParametersPayload].dictionary();
+  const Dictionary process = *payload["process"].dictionary();
+  EXPECT_GT(process["residentKilobytes"].integerValue(), 500);
+  EXPECT_GE(process["peakKilobytes"].integerValue(), process["residentKilobytes"].integerValue());
+  EXPECT_GE(process["descriptors"].integerValue(), 3);
+  EXPECT_GE(process["threads"].integerValue(), 2);
+  EXPECT_GE(process["user"].realValue() + process["system"].realValue(), 0.0);
+  EXPECT_GE(process["voluntarySwitches"].integerValue(), 1);
+  EXPECT_TRUE(process.contains("involuntarySwitches"));
+  EXPECT_EQ(payload["samples"], Value(Array{process["residentKilobytes"]}));
+}
+
+TEST_F(ClientProcessTest, theExampleUpdatesBetweenItsReports) {
+  givenDaemon();
+  const Outcome outcome = runProgram({TELVANE_PROGRAM_DIR "/report-metrics", "--seconds", "3", "--report-every", "2"},
+                                     {"TELVANE_ROOT=" + _root.path(), "HOME=" + _root.path()});
+  EXPECT_EQ(outcome.status, 0) << outcome.output;
+  ASSERT_EQ(categories(), std::vector<int64_t>{20});
+  const Dictionary event = *script().last(Operation::SendMessageWithDictionary).arguments[0].dictionary();
+  EXPECT_EQ((*event[kTelvaneMessageParametersPayload].dictionary())["samples"].array()->size(), 2u);
+}
+
+TEST_F(ClientProcessTest, theExampleSaysWhatItTakes) {
+  for (const std::vector<std::string>& wrong :
+       {std::vector<std::string>{"--seconds"}, {"--seconds", "0"}, {"--seconds", "1x"}, {"--what", "1"}}) {
+    std::vector<std::string> arguments{TELVANE_PROGRAM_DIR "/report-metrics"};
+    arguments.insert(arguments.end(), wrong.begin(), wrong.end());
+    const Outcome outcome = runProgram(std::move(arguments), {});
+    EXPECT_EQ(outcome.status, 2);
+    EXPECT_NE(outcome.output.find("usage: "), std::string::npos) << outcome.output;
+  }
 }
 
 }  // namespace

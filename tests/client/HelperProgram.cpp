@@ -211,6 +211,97 @@ int unloadTheLibrary() {
   return flush(*session) ? 0 : 2;
 }
 
+void countingMetrics(Telvane& session, std::atomic<int>& reports) {
+  session.registerPeriodicTaskForModule(1, true, true, [&reports](Dictionary* metrics) {
+    if (metrics != nullptr) metrics->set("number", ++reports);
+  });
+}
+
+// Leaves main with a timer that runs, which nobody stops.
+int leaveWithARunningTimer() {
+  static std::atomic<int> reports = 0;
+  static std::shared_ptr<Telvane> session = open();
+  countingMetrics(*session, reports);
+  session->startLogTimerWithInterval(1, 1, 5, 6);
+  while (reports < 2) std::this_thread::yield();
+  return 0;
+}
+
+// Lets the session go without stopping its timer, and stays until it would have fired again.
+int releaseWithARunningTimer() {
+  std::atomic<int> reports = 0;
+  std::atomic<int> otherTicks = 0;
+  std::shared_ptr<Telvane> session = open();
+  countingMetrics(*session, reports);
+  session->startLogTimerWithInterval(1, 1, 5, 6);
+  while (reports == 0) std::this_thread::yield();
+  session.reset();
+  const std::shared_ptr<Telvane> other = open();
+  other->registerPeriodicTaskForModule(1, true, false, [&otherTicks](Dictionary*) { ++otherTicks; });
+  other->startLogTimerWithInterval(1, 0, 5, 6);
+  while (otherTicks < 3) std::this_thread::yield();
+  other->stopLogTimer();
+  other->unregisterPeriodTaskForModule(1);
+  return reports == 1 ? 0 : 1;
+}
+
+// Ends while a block is called that never returns.
+int leaveWithAStuckBlock() {
+  static std::atomic<bool> isStuck = false;
+  static std::shared_ptr<Telvane> session = open();
+  session->registerPeriodicTaskForModule(1, true, true, [](Dictionary*) {
+    isStuck = true;
+    for (;;) ::pause();
+  });
+  session->startLogTimerWithInterval(1, 1, 5, 6);
+  while (!isStuck) std::this_thread::yield();
+  return 0;
+}
+
+int throwInModules() {
+  std::atomic<int> reports = 0;
+  std::shared_ptr<Telvane> session = open();
+  session->registerPeriodicTaskForModule(2, true, true, [](Dictionary*) { throw std::runtime_error("module"); });
+  session->registerPeriodicTaskForModule(3, true, true, [](Dictionary*) { throw 1; });
+  countingMetrics(*session, reports);
+  session->startLogTimerWithInterval(1, 1, 5, 6);
+  while (reports == 0) std::this_thread::yield();
+  session->stopLogTimer();
+  session->unregisterPeriodTaskForModule(1);
+  return flush(*session) ? 0 : 1;
+}
+
+// The child refuses its parent's periodic tasks and has its own; the parent's go on.
+int forkWithATimer() {
+  std::atomic<int> reports = 0;
+  std::shared_ptr<Telvane> session = open();
+  countingMetrics(*session, reports);
+  session->startLogTimerWithInterval(1, 1, 5, 6);
+  while (reports == 0) std::this_thread::yield();
+  const pid_t child = ::fork();
+  if (child == 0) {
+    if (session->registerPeriodicTaskForModule(2, true, true, [](Dictionary*) {})) std::_Exit(10);
+    if (!session->unregisterPeriodTaskForModule(1)) std::_Exit(11);
+    session->stopLogTimer();
+    session->startLogTimerWithInterval(1, 1, 5, 6);
+    session.reset();
+    std::atomic<int> ownReports = 0;
+    std::shared_ptr<Telvane> own = open();
+    countingMetrics(*own, ownReports);
+    own->startLogTimerWithInterval(1, 1, 5, 7);
+    while (ownReports == 0) std::this_thread::yield();
+    own->stopLogTimer();
+    own->unregisterPeriodTaskForModule(1);
+    std::_Exit(flush(*own) ? 0 : 12);
+  }
+  if (const int status = waitForChild(child); status != 0) return status;
+  const int reportsBefore = reports;
+  while (reports == reportsBefore) std::this_thread::yield();
+  session->stopLogTimer();
+  session->unregisterPeriodTaskForModule(1);
+  return flush(*session) ? 0 : 2;
+}
+
 const std::map<std::string, std::function<int()>> kModes = {
     {"sendAndReturn", sendAndReturn},
     {"sendAndExit", sendAndExit},
@@ -225,6 +316,11 @@ const std::map<std::string, std::function<int()>> kModes = {
     {"leaveWithoutADaemon", leaveWithoutADaemon},
     {"exitInACompletion", exitInACompletion},
     {"unloadTheLibrary", unloadTheLibrary},
+    {"leaveWithARunningTimer", leaveWithARunningTimer},
+    {"releaseWithARunningTimer", releaseWithARunningTimer},
+    {"leaveWithAStuckBlock", leaveWithAStuckBlock},
+    {"throwInModules", throwInModules},
+    {"forkWithATimer", forkWithATimer},
 };
 
 }  // namespace

@@ -3,11 +3,14 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <atomic>
 #include <cstdlib>
 #include <functional>
 #include <future>
 #include <memory>
 #include <string>
+#include <thread>
+#include <vector>
 
 #include "client/include/telvane/TelvaneConstants.h"
 #include "client/include/telvane/TelvaneSession.h"
@@ -143,6 +146,10 @@ TEST_F(TelvaneAPITest, doesNothingForANullSession) {
   TelvaneFlushMessages(nullptr);
   TelvaneFlushMessagesWithCompletion(nullptr, end, nullptr);
   EXPECT_FALSE(TelvaneUploadLogWithArray(nullptr, dictionary.get()));
+  EXPECT_FALSE(TelvaneRegisterPeriodicTaskForModule(nullptr, 1, true, true, backends, nullptr));
+  EXPECT_FALSE(TelvaneUnregisterPeriodTaskForModule(nullptr, 1));
+  TelvaneStartLogTimerWithInterval(nullptr, 1, 1, 5, 6);
+  TelvaneStopLogTimer(nullptr);
 }
 
 TEST_F(TelvaneAPITest, opensASessionWithWhatItIsGiven) {
@@ -361,6 +368,155 @@ TEST_F(TelvaneAPITest, spellsTheConstantsAsTheDaemonReadsThem) {
   EXPECT_STREQ(kTelvaneHierarchyTokenTokenID, "token");
   EXPECT_STREQ(kTelvaneBackendHTTPPost, "splunk");
   EXPECT_STREQ(kTelvaneErrorDomain, "TelvaneErrorDomain");
+}
+
+// What a module's callback was called with, and what it does then.
+struct Module {
+  TelvaneRef session = nullptr;
+  std::function<void(plist_t metrics)> act = {};
+  std::atomic<int> updates = 0;
+  std::atomic<int> reports = 0;
+  std::atomic<bool> wasEmpty = true;
+
+  static void call(plist_t metrics, void* context) {
+    Module& module = *static_cast<Module*>(context);
+    if (metrics == nullptr) {
+      ++module.updates;
+      return;
+    }
+    if (plist_get_node_type(metrics) != PLIST_DICT || plist_dict_get_size(metrics) != 0) module.wasEmpty = false;
+    if (module.act) module.act(metrics);
+    ++module.reports;
+  }
+};
+
+TEST_F(TelvaneAPITest, reportsThePeriodicMetricsOfItsModules) {
+  Module first{.act = [](plist_t metrics) { plist_dict_set_item(metrics, "frames", plist_new_uint(30)); }};
+  Module second{.act = [](plist_t metrics) { plist_dict_set_item(metrics, "drops", plist_new_uint(2)); }};
+  const Session session = open();
+  EXPECT_TRUE(TelvaneRegisterPeriodicTaskForModule(session.get(), 1, true, true, Module::call, &first));
+  EXPECT_TRUE(TelvaneRegisterPeriodicTaskForModule(session.get(), 2, false, true, Module::call, &second));
+  TelvaneStartLogTimerWithInterval(session.get(), 1, 1, 40000, 65535);
+  ASSERT_TRUE(script().waitFor(Operation::SendMessageWithDictionary, 1));
+  TelvaneStopLogTimer(session.get());
+  EXPECT_TRUE(TelvaneUnregisterPeriodTaskForModule(session.get(), 1));
+  EXPECT_TRUE(TelvaneUnregisterPeriodTaskForModule(session.get(), 2));
+  EXPECT_TRUE(TelvaneUnregisterPeriodTaskForModule(session.get(), 2)) << "although it is gone";
+  EXPECT_EQ(lastMessage(), (Dictionary{{Key("ParametersCategory"), 40000},
+                                       {Key("ParametersType"), 65535},
+                                       {Key("ParametersPayload"), Dictionary{{Key("frames"), 30}, {Key("drops"), 2}}},
+                                       {Key("ParametersFlag"), 1}}));
+  EXPECT_TRUE(first.wasEmpty && second.wasEmpty);
+  EXPECT_GE(first.reports, 1);
+  EXPECT_EQ(first.updates, 0);
+}
+
+TEST_F(TelvaneAPITest, updatesWithoutADictionary) {
+  Module module;
+  const Session session = open();
+  EXPECT_TRUE(TelvaneRegisterPeriodicTaskForModule(session.get(), 1, true, true, Module::call, &module));
+  TelvaneStartLogTimerWithInterval(session.get(), 1000, 0, 5, 6);
+  while (module.updates == 0) std::this_thread::yield();
+  EXPECT_TRUE(TelvaneUnregisterPeriodTaskForModule(session.get(), 1));
+  EXPECT_EQ(module.updates, 1);
+  EXPECT_EQ(module.reports, 0);
+}
+
+TEST_F(TelvaneAPITest, refusesANullModuleCallback) {
+  const Session session = open();
+  EXPECT_FALSE(TelvaneRegisterPeriodicTaskForModule(session.get(), 1, true, true, nullptr, nullptr));
+}
+
+TEST_F(TelvaneAPITest, reportsWithoutMetricsThatCannotBeCarried) {
+  Module bad{.act = [](plist_t metrics) { plist_dict_set_item(metrics, "deep", tooDeepDictionary().release()); }};
+  Module good{.act = [](plist_t metrics) { plist_dict_set_item(metrics, "a", plist_new_uint(1)); }};
+  const Session session = open();
+  EXPECT_TRUE(TelvaneRegisterPeriodicTaskForModule(session.get(), 1, false, true, Module::call, &bad));
+  EXPECT_TRUE(TelvaneRegisterPeriodicTaskForModule(session.get(), 2, false, true, Module::call, &good));
+  TelvaneStartLogTimerWithInterval(session.get(), 1000, 1, 5, 6);
+  ASSERT_TRUE(script().waitFor(Operation::SendMessageWithDictionary, 1));
+  EXPECT_TRUE(TelvaneUnregisterPeriodTaskForModule(session.get(), 1));
+  EXPECT_TRUE(TelvaneUnregisterPeriodTaskForModule(session.get(), 2));
+  EXPECT_EQ(bad.reports, 1);
+  EXPECT_EQ(lastMessage()["ParametersPayload"], Value(Dictionary{{Key("a"), 1}}));
+}
+
+TEST_F(TelvaneAPITest, unregistersAModuleInItsOwnCallback) {
+  Module module;
+  const Session session = open();
+  module.act = [&](plist_t metrics) {
+    plist_dict_set_item(metrics, "a", plist_new_uint(1));
+    EXPECT_TRUE(TelvaneUnregisterPeriodTaskForModule(session.get(), 1));
+    TelvaneStopLogTimer(session.get());
+  };
+  EXPECT_TRUE(TelvaneRegisterPeriodicTaskForModule(session.get(), 1, true, true, Module::call, &module));
+  TelvaneStartLogTimerWithInterval(session.get(), 1, 1, 5, 6);
+  ASSERT_TRUE(script().waitFor(Operation::SendMessageWithDictionary, 1));
+  flush(session);
+  EXPECT_TRUE(TelvaneUnregisterPeriodTaskForModule(session.get(), 1));
+  EXPECT_EQ(module.reports, 1);
+}
+
+// The context of a module goes as soon as the call returns, while its timer runs.
+TEST_F(TelvaneAPITest, callsNoModuleThatIsUnregistered) {
+  const Session session = open();
+  for (int round = 0; round < 40; ++round) {
+    std::atomic<bool> isGone = false;
+    auto module = std::make_unique<Module>();
+    module->act = [&](plist_t) {
+      for (int i = 0; i < 100; ++i) std::this_thread::yield();
+      EXPECT_FALSE(isGone);
+    };
+    EXPECT_TRUE(TelvaneRegisterPeriodicTaskForModule(session.get(), 1, true, true, Module::call, module.get()));
+    TelvaneStartLogTimerWithInterval(session.get(), 1000, 1, 5, 6);
+    if (round % 2 == 0) {
+      while (module->reports == 0) std::this_thread::yield();
+    }
+    TelvaneStopLogTimer(session.get());
+    EXPECT_TRUE(TelvaneUnregisterPeriodTaskForModule(session.get(), 1));
+    isGone = true;
+    module.reset();
+  }
+}
+
+// Threads register and unregister, start and stop, all at once; a context goes as soon as its module is unregistered.
+TEST_F(TelvaneAPITest, keepsThePromiseOfUnregisteringHoweverThreadsMeet) {
+  const Session session = open();
+  std::atomic<bool> isDone = false;
+  std::thread timer([&] {
+    Module pulse;
+    EXPECT_TRUE(TelvaneRegisterPeriodicTaskForModule(session.get(), 1000, true, true, Module::call, &pulse));
+    while (!isDone) {
+      const int before = pulse.updates;
+      TelvaneStartLogTimerWithInterval(session.get(), 1, 2, 5, 6);
+      while (pulse.updates == before) std::this_thread::yield();
+      TelvaneStopLogTimer(session.get());
+    }
+    EXPECT_TRUE(TelvaneUnregisterPeriodTaskForModule(session.get(), 1000));
+  });
+  std::vector<std::thread> threads;
+  std::atomic<int> calls = 0;
+  for (uint32_t number = 1; number <= 3; ++number) {
+    threads.emplace_back([&, number] {
+      for (int round = 0; round < 100; ++round) {
+        auto module = std::make_unique<Module>();
+        module->act = [&calls](plist_t metrics) {
+          ++calls;
+          plist_dict_set_item(metrics, "a", plist_new_uint(1));
+        };
+        EXPECT_TRUE(
+            TelvaneRegisterPeriodicTaskForModule(session.get(), number, true, true, Module::call, module.get()));
+        while (round % 10 == 0 && module->updates == 0) std::this_thread::yield();
+        EXPECT_TRUE(TelvaneUnregisterPeriodTaskForModule(session.get(), number));
+        calls += module->updates;
+      }
+    });
+  }
+  for (std::thread& thread : threads) thread.join();
+  isDone = true;
+  timer.join();
+  EXPECT_GE(calls, 30);
+  EXPECT_FALSE(flush(session).hasError);
 }
 
 TEST_F(TelvaneAPITest, finishesASessionThatIsReleased) {
