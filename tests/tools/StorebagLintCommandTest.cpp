@@ -42,6 +42,20 @@ TEST_F(StorebagLintCommandTest, exitsWithOneOnlyWhenThereIsAnError) {
   EXPECT_EQ(_errors.str(), "");
 }
 
+TEST_F(StorebagLintCommandTest, takesTheBagsNameFromTheFiles) {
+  const Value bag = bagWith("release", Dictionary{{Key("vdr"), Dictionary{{kProfileActive, true}}}});
+  for (const char* name : {"media", "bags/media.plist", "media.v2.json"}) {
+    EXPECT_EQ(lint(_scratch.write(name, plist(bag))), 0);
+    EXPECT_THAT(_output.str(), HasSubstr("warning: release/vdr: is made for the client types 7, 11 and 13 only, and "
+                                         "the bag \"media\" is read by 6, 14, 15"))
+        << name;
+  }
+  for (const char* name : {"conferencing.plist", "another.plist", "multimedia"}) {
+    EXPECT_EQ(lint(_scratch.write(name, plist(bag))), 0);
+    EXPECT_EQ(_output.str(), "0 errors, 0 warnings\n") << name;
+  }
+}
+
 TEST_F(StorebagLintCommandTest, saysInOneLineWhyAFileCannotBeRead) {
   for (const std::string& path :
        {_scratch.at("nothing"), _scratch.path(), _scratch.write("text", "garbage"), _scratch.write("empty", ""),
