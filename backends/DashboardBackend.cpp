@@ -130,7 +130,8 @@ bool DashboardBackend::start(const Server& server) {
   _networkProcQueue->sync([this, &server, &isStarted] {
     _networkProcQueue->assertOnQueue();
     if (server.isReliable) useReliableUDP();
-    isStarted = connect(server) && startTimer(server.period);
+    _period = server.period;
+    isStarted = connect(server) && startTimer();
     if (isStarted) return;
     cleanupSources();
     _socket.reset();  // the read source's cancel handler closes it then, if there is one
@@ -168,11 +169,11 @@ bool DashboardBackend::connect(const Server& server) {
   return false;
 }
 
-bool DashboardBackend::startTimer(std::chrono::milliseconds period) {
+bool DashboardBackend::startTimer() {
   Platform& platform = _context.platform();
   try {
     _timer = RepeatingTimer::start(
-        platform.dispatch, platform.clock, _networkProcQueue, period, period, kTimerLeeway,
+        platform.dispatch, platform.clock, _networkProcQueue, _period, _period, kTimerLeeway,
         [weakSelf = weak()] {
           const auto self = weakSelf.lock();
           if (self == nullptr) return;
@@ -319,13 +320,22 @@ void DashboardBackend::cleanup() {
     if (self->_messageQueue.empty()) {
       self->cleanupSources();
     } else if (self->_cleanupState == CleanupState::Running) {
-      self->_cleanupState = CleanupState::Requested;
-      self->_livesOn = self;
+      self->requestCleanup();
     }
   });
 }
 
+// The timer does not hold this object; a job does until the next tick. Should that be late, the job does its work.
+void DashboardBackend::requestCleanup() {
+  _cleanupState = CleanupState::Requested;
+  _networkProcQueue->asyncAfter(_period + kTimerLeeway, [self = shared()] {
+    self->_networkProcQueue->assertOnQueue();
+    if (self->_cleanupState == CleanupState::Requested) self->continueCleanup();
+  });
+}
+
 void DashboardBackend::continueCleanup() {
+  if (_timer == nullptr) return;  // cleaned up already
   if (_messageQueue.empty()) {
     log().message("DashboardBackend(myPeriodicTask): clean up at myPeriodicTask.");
     cleanupSources();
@@ -337,21 +347,17 @@ void DashboardBackend::continueCleanup() {
 
 void DashboardBackend::scheduleLastResort() {
   log().message("DashboardBackend(myPeriodicTask): scheduled last resort clean-up in {} ms.", kLastResort.count());
-  _networkProcQueue->asyncAfter(kLastResort, [weakSelf = weak()] {
-    const auto self = weakSelf.lock();
-    if (self == nullptr) return;
+  _networkProcQueue->asyncAfter(kLastResort, [self = shared()] {
     self->_networkProcQueue->assertOnQueue();
     self->cleanupSources();
   });
 }
 
-// REQUIRES: the caller holds this object.
 void DashboardBackend::cleanupSources() {
   if (_timer != nullptr) _timer->cancel();
   _timer.reset();
   if (_readSource != nullptr) _readSource->cancel();
   _readSource.reset();
-  _livesOn.reset();
 }
 
 }  // namespace telvane

@@ -30,9 +30,10 @@ namespace telvane {
 // device busy with nothing or a session's end endless: 0 and less count as 500 ms, less than 10 ms as 10 ms, more than
 // a minute as a minute.
 //
-// Let go of without cleanup it stops at once. After cleanup it lives on until nothing waits any more, or for 9.5 s from
-// the next tick of the timer at most. A transaction is held from each event until its datagram was tried once, but not
-// while acknowledgements are awaited: a dashboard that is not there does not keep the process from ending.
+// Let go of without cleanup it stops at once. After cleanup it goes on until nothing waits any more, for 9.5 s from the
+// next tick of the timer at most, and the jobs of that clean-up keep it so long. A transaction is held from each event
+// until its datagram was tried once, but not while acknowledgements are awaited: a dashboard that is not there does not
+// keep the process from ending.
 class DashboardBackend final : public TelvaneBackend {
  public:
   static constexpr std::chrono::milliseconds kDefaultPeriod{500};
@@ -97,7 +98,7 @@ class DashboardBackend final : public TelvaneBackend {
   bool start(const Server& server) EXCLUDES(*_networkProcQueue);
   void useReliableUDP() REQUIRES(*_networkProcQueue);
   bool connect(const Server& server) REQUIRES(*_networkProcQueue);
-  bool startTimer(std::chrono::milliseconds period) REQUIRES(*_networkProcQueue);
+  bool startTimer() REQUIRES(*_networkProcQueue);
 
   // On the network queue.
   void tryToSendMsg(const uint8_t* bytes, size_t length, uint16_t eventNumber) REQUIRES(*_networkProcQueue);
@@ -109,6 +110,7 @@ class DashboardBackend final : public TelvaneBackend {
   bool checkUnacknowledged(UDPPacketToSend& packet) REQUIRES(*_networkProcQueue);
   bool checkUnsent(UDPPacketToSend& packet) REQUIRES(*_networkProcQueue);
   void continueCleanup() REQUIRES(*_networkProcQueue);
+  void requestCleanup() REQUIRES(*_networkProcQueue);
   void scheduleLastResort() REQUIRES(*_networkProcQueue);
   void cleanupSources() REQUIRES(*_networkProcQueue);
 
@@ -126,6 +128,7 @@ class DashboardBackend final : public TelvaneBackend {
 
   // Constant once it is started.
   bool _reliableUDP = false;
+  std::chrono::milliseconds _period = kDefaultPeriod;
   std::optional<String> _postURL;
 
   // Confined to the network queue. The socket is null once closed; the read source's cancel handler holds it too.
@@ -134,8 +137,6 @@ class DashboardBackend final : public TelvaneBackend {
   std::unique_ptr<ReadSource> _readSource GUARDED_BY(*_networkProcQueue);     // in reliable mode
   std::unique_ptr<RepeatingTimer> _timer GUARDED_BY(*_networkProcQueue);
   CleanupState _cleanupState GUARDED_BY(*_networkProcQueue) = CleanupState::Running;
-  // This object, from a cleanup that has to wait until its end.
-  std::shared_ptr<DashboardBackend> _livesOn GUARDED_BY(*_networkProcQueue);
 };
 
 }  // namespace telvane
