@@ -69,7 +69,7 @@ class UploadBench {
     section.set("upload_server", Dictionary{{kProfilePostURL, _instance.collectorURL("/upload")}});
     bag.set(kEnvironmentRelease, section);
     _instance.givenStorebag(kBagName, bag);
-    _instance.startDaemon({"--log-level", "error"});
+    _instance.startDaemon({"--log-level", "default"});
     // Everything that is done once has been done then.
     writeFile("small");
     runUpload();
