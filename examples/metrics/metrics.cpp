@@ -145,10 +145,13 @@ bool configure(Telvane& session) {
   return isConfigured.wait_for(kPatience) == std::future_status::ready;
 }
 
+// Reports do not wait in the daemon, so there may be nothing left for it to send, which is no failure.
 bool flush(Telvane& session) {
   auto promise = std::make_shared<std::promise<bool>>();
   std::future<bool> isFlushed = promise->get_future();
-  session.flushMessagesWithCompletion([promise](const std::optional<Error>& error) { promise->set_value(!error); });
+  session.flushMessagesWithCompletion([promise](const std::optional<Error>& error) {
+    promise->set_value(!error.has_value() || error->description() == "Nothing to flush");
+  });
   return isFlushed.wait_for(kPatience) == std::future_status::ready && isFlushed.get();
 }
 
