@@ -34,7 +34,7 @@ constexpr size_t kMostAbsences = 2;
 constexpr uint64_t kMostMillisecondsAway = 1500;
 // What a daemon at rest may take more than at the end of the first round.
 constexpr size_t kDescriptorSlack = 6;
-constexpr int64_t kMemorySlack = 16 << 20;
+constexpr int64_t kMemorySlack = 32 << 20;
 // What it may take more on average in the last third of the rounds than in the middle third. About 1.4 MiB are in use
 // at rest; the rest is kept by the allocator's arenas, one for each thread, each as large as its worst moment so far.
 constexpr int64_t kMemoryMargin = 4 << 20;
