@@ -36,7 +36,7 @@ class DashboardReceiverTest : public ::testing::Test {
                                              _store);
     ASSERT_TRUE(receiver.has_value());
     _receiver = std::move(*receiver);
-    _socket = std::move(*_sockets.newSocket());
+    _socket = *_sockets.newSocket();
     ASSERT_TRUE(_socket->connect(_receiver->address()).has_value());
   }
   static Bytes datagram(uint16_t eventID, bool isReliable = true, const std::string& text = " k=v") {

@@ -155,6 +155,12 @@ ClientScript& ClientScript::sendMany(uint16_t category, const std::string& from,
 
 ClientScript& ClientScript::flush() { return add("flush"); }
 
+ClientScript& ClientScript::uploadLogData(Array logData) {
+  Dictionary arguments;
+  arguments.set(kPayload, std::move(logData));
+  return add("uploadLogData", std::move(arguments));
+}
+
 ClientScript& ClientScript::upload(const std::string& path) {
   Dictionary arguments;
   arguments.set(kPath, path);

@@ -34,6 +34,8 @@ class ClientScript {
   // Uploads the file: "handed over: yes" or "no" when the call returns, and for a yes "uploaded: yes" or "no" when the
   // daemon has answered.
   ClientScript& upload(const std::string& path);
+  // Uploads the log data: "log data uploaded: yes" or "no" when the daemon has answered.
+  ClientScript& uploadLogData(Array logData);
   ClientScript& share(Dictionary sharedData);
   ClientScript& setDigestKey(const std::string& key, int32_t algorithm = 0);
   ClientScript& sendOneShot(Dictionary sessionInfo, Value userInfo, uint16_t category, uint16_t type, Value payload);

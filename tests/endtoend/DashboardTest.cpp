@@ -8,6 +8,7 @@
 #include <sstream>
 
 #include "interfaces/StorebagKeys.h"
+#include "platform/KeyedArchive.h"
 #include "tests/endtoend/LiveDashboard.h"
 #include "tests/endtoend/WireFixture.h"
 
@@ -158,6 +159,32 @@ TEST_F(DashboardTest, sessionsEndWhenTheirLastEventsAreAcknowledged) {
     return instance().daemonLogHas("DashboardBackend(myPeriodicTask): clean up at myPeriodicTask.");
   })) << instance().daemonLog();
   EXPECT_THAT(copies(dashboard, kEvent), Each(2));
+  stopDaemon();
+}
+
+TEST_F(DashboardTest, isToldWhereUploadedLogDataLie) {
+  LiveDashboard dashboard;
+  Dictionary section;
+  section.set("dashboard", Dictionary{{kProfileIP, "127.0.0.1"},
+                                      {kProfilePort, dashboard.port()},
+                                      {kProfilePostURL, server().url("/logdata")}});
+  givenSection(section);
+  givenPostsAnsweredBy([](const WireRequest&) { return WireServer::answer(200, "https://logs.example/7?a=b"); });
+  startDaemon();
+  const Array logData{Dictionary{{Key("LogData"), "line\n"}, {Key("StartTime"), 1}, {Key("EndTime"), 2}}};
+  ClientScript script;
+  script.open(sessionInfo(), userInfo()).configure().uploadLogData(logData);
+  EXPECT_THAT(run(script), HasSubstr("log data uploaded: yes")) << instance().daemonLog();
+  ASSERT_EQ(posts().size(), 1u);
+  EXPECT_EQ(posts().front().target(), "/logdata");
+  EXPECT_EQ(posts().front().header("Content-Type"), "application/octet-stream");
+  const auto archived = keyedarchive::unarchive(Data::copyOf(posts().front().body));
+  ASSERT_TRUE(archived.has_value());
+  EXPECT_EQ(*archived, Value(logData));
+  EXPECT_TRUE(eventually([&dashboard] {
+    const std::vector<std::string> texts = dashboard.texts(0);
+    return std::find(texts.begin(), texts.end(), " LogDataUploadLocation=https://logs.example/7?a\\=b") != texts.end();
+  }));
   stopDaemon();
 }
 

@@ -98,7 +98,7 @@ class Runner {
         {"oneShot", &Runner::oneShot},   {"setDigestKey", &Runner::setDigestKey},
         {"wait", &Runner::waitForInput}, {"openAggregating", &Runner::openAggregating},
         {"letGo", &Runner::letGo},       {"sendMany", &Runner::sendMany},
-        {"upload", &Runner::upload},
+        {"upload", &Runner::upload},     {"uploadLogData", &Runner::uploadLogData},
     };
     (this->*kMethods.at(std::string(step[ClientScript::kStep].text())))(step);
   }
@@ -192,6 +192,16 @@ class Runner {
     std::future<bool> answer = answered->get_future();
     const bool hasCome = answer.wait_for(kPatience) == std::future_status::ready;
     sayLine(std::string("uploaded: ") + (!hasCome ? "no answer" : answer.get() ? "yes" : "no"));
+  }
+
+  void uploadLogData(const Dictionary& step) {
+    auto answered = std::make_shared<std::promise<bool>>();
+    std::future<bool> answer = answered->get_future();
+    const bool isTaken = session()->uploadDataArray(
+        *step[ClientScript::kPayload].array(),
+        [answered](bool isSuccess, const std::optional<Error>&) { answered->set_value(isSuccess); });
+    const bool hasCome = isTaken && answer.wait_for(kPatience) == std::future_status::ready;
+    sayLine(std::string("log data uploaded: ") + (!hasCome ? "no answer" : answer.get() ? "yes" : "no"));
   }
 
   void share(const Dictionary& step) {

@@ -25,7 +25,7 @@ std::unique_ptr<DatagramServer> echo(const IPv4SocketAddress& address = {{127, 0
 
 class Client {
  public:
-  explicit Client(const IPv4SocketAddress& server) : _socket(std::move(*_sockets.newSocket())) {
+  explicit Client(const IPv4SocketAddress& server) : _socket(*_sockets.newSocket()) {
     EXPECT_TRUE(_socket->connect(server).has_value());
   }
   bool send(const std::string& text) {

@@ -44,7 +44,7 @@ class SystemDatagramSocketTest : public ::testing::Test {
     EXPECT_TRUE(_socket->bind().has_value());
     EXPECT_TRUE(_socket->connect(_server->address()).has_value());
   }
-  std::unique_ptr<DatagramSocket> newSocket() { return std::move(*_sockets.newSocket()); }
+  std::unique_ptr<DatagramSocket> newSocket() { return *_sockets.newSocket(); }
   static Result<size_t> send(DatagramSocket& socket, const std::string& text) {
     return socket.send(reinterpret_cast<const uint8_t*>(text.data()), text.size());
   }
