@@ -3,6 +3,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <array>
 #include <cerrno>
 
 #include "tests/support/FaultyFileSystem.h"
@@ -222,6 +223,26 @@ TEST_F(MemorySubmittableLogsTest, leavesTheLogWhenItCannotBeSubmitted) {
   EXPECT_TRUE(isError(_logs.createTemporaryLog("224", "/var/logs/two.ips"), EROFS));
   EXPECT_EQ(_files.content(kLog), "text");
   EXPECT_EQ(_files.content(kSubmitted), "earlier");
+}
+
+TEST_F(MemoryFileSystemTest, aTemporaryFileHasNoNameAndFeelsFaults) {
+  FaultyFileSystem faulty(_files);
+  const auto file = faulty.newTemporaryFile("/tmp/new");
+  ASSERT_TRUE(isOk(file));
+  EXPECT_TRUE(isOk((*file)->append("0123456789")));
+  EXPECT_EQ((*file)->size(), 10u);
+  std::array<char, 4> buffer{};
+  EXPECT_EQ((*file)->read(7, buffer), 3);
+  EXPECT_EQ(std::string_view(buffer.data(), 3), "789");
+  EXPECT_EQ((*file)->read(20, buffer), 0);
+  EXPECT_TRUE(_files.filesBelow("/tmp")->empty());
+  faulty.fillDisk();
+  EXPECT_TRUE(isError((*file)->append("x"), ENOSPC));
+  faulty.heal();
+  faulty.failReads(EIO, "/tmp/new");
+  EXPECT_EQ((*file)->read(0, buffer), -1);
+  faulty.failWrites(EACCES, "/tmp/new");
+  EXPECT_TRUE(isError(faulty.newTemporaryFile("/tmp/new"), EACCES));
 }
 
 }  // namespace
