@@ -2,6 +2,7 @@
 
 #include "interfaces/TelvaneErrors.h"
 #include "tests/connectivity/ConnectivityHelperFixture.h"
+#include "tests/support/Matchers.h"
 
 namespace telvane::testing {
 namespace {
@@ -143,6 +144,26 @@ TEST_F(ConnectivityHelperRequestsTest, aBackgroundPOSTGoesOutFromAContainerThatI
   EXPECT_TRUE(world.network().requests().front().isUpload);
   EXPECT_EQ(world.network().requests().front().request.body.view(), "events");
   EXPECT_TRUE(process.platform().files.filesBelow(Helper::storageRootFolder())->empty());
+}
+
+// There is no folder for containers, so none can have been made.
+TEST_F(ConnectivityHelperRequestsTest, aBodyThatIsAFileGoesOutFromItInEitherMode) {
+  world.network().answer(kURL, NetworkAnswer::ok());
+  for (const int32_t mode : {Helper::POSTRequestMode(), Helper::kBackgroundPOSTRequestMode}) {
+    givenActiveHelper(mode);
+    const auto file = std::shared_ptr(process.platform().files.newTemporaryFile("/tmp").value());
+    ASSERT_TRUE(isOk(file->append("a large body")));
+    URLRequest made = request();
+    made.method = "POST";
+    made.bodyFile = file;
+    helper->postURLRequestWithCompletionHandler(std::move(made), noteCompletion());
+    world.runUntilIdle();
+    ASSERT_FALSE(world.network().requests().empty()) << mode;
+    EXPECT_TRUE(world.network().requests().back().isUpload);
+    EXPECT_EQ(world.network().requests().back().request.body.view(), "a large body");
+  }
+  EXPECT_EQ(world.network().requests().size(), 2u);
+  EXPECT_EQ(completions.size(), 2u);
 }
 
 TEST_F(ConnectivityHelperRequestsTest, aBackgroundPOSTWithoutAPlaceForItsContainerStopsSilently) {
