@@ -30,7 +30,8 @@ bool store(std::string& compressed, TemporaryFile& file) {
 
 }  // namespace
 
-CompressedCopy compressedCopyOf(const SandboxExtension& extension, FileSystem& files) {
+CompressedCopy compressedCopyOf(const SandboxExtension& extension, FileSystem& files,
+                                const std::function<bool()>& isCancelled) {
   using Outcome = CompressedCopy::Outcome;
   const Result<uint64_t> size = extension.size();
   if (size.has_error() || *size == 0) return {Outcome::NothingToRead, nullptr};
@@ -42,6 +43,7 @@ CompressedCopy compressedCopyOf(const SandboxExtension& extension, FileSystem& f
   if (deflater.has_error() || file.has_error()) return {};
   std::string compressed;
   for (uint64_t offset = 0; !piece->empty();) {
+    if (isCancelled()) return {};
     offset += piece->size();
     if (deflater->add(*piece, compressed).has_error() || !store(compressed, **file)) return {};
     if (offset == *size) break;

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <functional>
 #include <memory>
 
 #include "foundation/Error.h"
@@ -20,6 +21,8 @@ struct CompressedCopy {
 // size less than half a MiB is in memory at a time. The file counts as large as it is when this is called: what it
 // grows by meanwhile is left out, and of one that shrinks goes what is there. NothingToRead: it is empty, or cannot be
 // read to its end. NotMade: there is no room for the copy.
-CompressedCopy compressedCopyOf(const SandboxExtension& extension, FileSystem& files);
+// isCancelled: asked before each piece; once it says yes, the copy is NotMade.
+CompressedCopy compressedCopyOf(const SandboxExtension& extension, FileSystem& files,
+                                const std::function<bool()>& isCancelled);
 
 }  // namespace telvane

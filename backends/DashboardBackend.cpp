@@ -188,10 +188,10 @@ bool DashboardBackend::startTimer() {
         });
   } catch (const std::exception&) {
     // No thread or memory left for it.
-    log().error("DashboardBackend(initWithName): can't create timer source.");
-    return false;
   }
-  return true;
+  if (_timer != nullptr) return true;
+  log().error("DashboardBackend(initWithName): can't create timer source.");
+  return false;
 }
 
 std::optional<String> DashboardBackend::sendMessage(Dictionary blob, Date timestamp, uint16_t method, uint16_t respCode,
@@ -245,7 +245,7 @@ String DashboardBackend::writeLocalLog(std::span<const uint8_t> datagram) {
 }
 
 void DashboardBackend::tryToSendMsg(const uint8_t* bytes, size_t length, uint16_t eventNumber) {
-  if (_socket == nullptr) return;  // closed: nobody would try it again
+  if (_socket == nullptr || _timer == nullptr) return;  // over: nobody would try it again
   const bool isSent = sendCompletely(bytes, length);
   if (isSent && !_reliableUDP) return;
   UDPPacketToSend packet = UDPPacketToSend::initWithBytes(bytes, length, eventNumber);
@@ -320,7 +320,9 @@ void DashboardBackend::cleanup() {
     if (self->_messageQueue.empty()) {
       self->cleanupSources();
     } else if (self->_cleanupState == CleanupState::Running) {
-      self->requestCleanup();
+      self->_lingering = self->_context.lingeringDashboards().take();
+      // Each one-shot message makes a dashboard; a crowd of them must not take all descriptors of the process.
+      self->_lingering != nullptr ? self->requestCleanup() : self->cleanupSources();
     }
   });
 }
@@ -358,6 +360,7 @@ void DashboardBackend::cleanupSources() {
   _timer.reset();
   if (_readSource != nullptr) _readSource->cancel();
   _readSource.reset();
+  _lingering.reset();
 }
 
 }  // namespace telvane

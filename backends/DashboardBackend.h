@@ -11,6 +11,7 @@
 #include "backends/UDPPacketToSend.h"
 #include "platform/DatagramSocket.h"
 #include "platform/dispatch/RepeatingTimer.h"
+#include "util/Places.h"
 
 namespace telvane {
 
@@ -137,6 +138,7 @@ class DashboardBackend final : public TelvaneBackend {
   std::unique_ptr<ReadSource> _readSource GUARDED_BY(*_networkProcQueue);     // in reliable mode
   std::unique_ptr<RepeatingTimer> _timer GUARDED_BY(*_networkProcQueue);
   CleanupState _cleanupState GUARDED_BY(*_networkProcQueue) = CleanupState::Running;
+  Places::Place _lingering GUARDED_BY(*_networkProcQueue);  // after a cleanup that has to wait
 };
 
 }  // namespace telvane

@@ -1,7 +1,10 @@
 #include "backends/UploadBackend.h"
 
+#include <algorithm>
+
 #include "backends/CompressedCopy.h"
 #include "interfaces/StorebagKeys.h"
+#include "platform/Mutex.h"
 #include "platform/system/UTF8.h"
 #include "util/QueryText.h"
 
@@ -11,37 +14,59 @@ namespace {
 constexpr std::string_view kDescription = "Vantico AFRC log";
 constexpr std::string_view kSuccess = "success";
 
+// Of a server's answer, as much as a log line should hold.
+constexpr size_t kMostLoggedBytes = 4096;
+
+// What a server says may be anything: controls would act on the terminal that shows the log, which itself sees to line
+// feeds.
+std::string loggable(std::string_view text) {
+  size_t size = std::min(text.size(), kMostLoggedBytes);
+  while (size < text.size() && size > 0 && (static_cast<uint8_t>(text[size]) & 0xC0u) == 0x80u) --size;
+  std::string line(text.substr(0, size));
+  for (char& c : line) {
+    if ((static_cast<uint8_t>(c) < ' ' && c != '\n') || c == '\x7f') c = ' ';
+  }
+  if (size < text.size()) line += fmt::format("... ({} bytes)", text.size());
+  return line;
+}
+
+std::string_view lastComponent(std::string_view path) { return path.substr(path.rfind('/') + 1); }
+
+}  // namespace
+
 // What became of a post.
-struct ServerAnswer {
+struct UploadBackend::ServerAnswer {
   explicit ServerAnswer(std::shared_ptr<Semaphore> made) : semaphore(std::move(made)) {}
 
   const std::shared_ptr<Semaphore> semaphore;
-  // Written before the signal, read after it.
-  std::optional<Data> data;
-  std::optional<Error> error;
+  Mutex mutex;
+  std::optional<Data> data GUARDED_BY(mutex);
+  std::optional<Error> error GUARDED_BY(mutex);
 };
+
+namespace {
 
 // What the post's completion holds. It wakes the waiter when it goes, whether or not it was called: a helper that is no
 // longer active lets completions go without a word, and the waiter has all the time in the world.
+template <class Answer>
 class AnswerGiver {
  public:
-  explicit AnswerGiver(std::shared_ptr<ServerAnswer> answer) : _answer(std::move(answer)) {}
+  explicit AnswerGiver(std::shared_ptr<Answer> answer) : _answer(std::move(answer)) {}
   AnswerGiver(AnswerGiver&&) noexcept = default;
   AnswerGiver& operator=(AnswerGiver&&) = delete;
   ~AnswerGiver() {
     if (_answer != nullptr) _answer->semaphore->signal();
   }
   void give(const Data& data, const URLResponse* response, const std::optional<Error>& error) {
+    MutexLock lock(_answer->mutex);
     // A server may well answer nothing; without one there are no data either.
     if (!data.empty() || (response != nullptr && !error.has_value())) _answer->data = data;
     _answer->error = error;
   }
 
  private:
-  std::shared_ptr<ServerAnswer> _answer;
+  std::shared_ptr<Answer> _answer;
 };
-
-std::string_view lastComponent(std::string_view path) { return path.substr(path.rfind('/') + 1); }
 
 }  // namespace
 
@@ -73,23 +98,40 @@ bool UploadBackend::uploadFileAtPath(const String& path, const ExtensionToken& e
     log().error("UploadBackend(uploadFileAtPath): Only upload a regular file.");
     return false;
   }
-  std::optional<URLRequest> request = newRequest(path, *extension);
+  const auto answer = std::make_shared<ServerAnswer>(_context.platform().dispatch.newSemaphore(0));
+  const Result<uint64_t> size = extension->size();
+  const auto place = _context.runningUploads().begin(answer->semaphore, size.has_value() ? *size : 0);
+  if (!place.has_value()) {
+    log().error("UploadBackend(uploadFileAtPath): Too much is being uploaded already, or the daemon is about to end");
+    return false;
+  }
+  std::optional<URLRequest> request = newRequest(path, *extension, *place);
   if (!request.has_value()) return false;
-  if (const auto helper = _reportingSessionConnectivityDelegate.lock()) {
-    post(*helper, *std::move(request), *extension, path);
+  const auto helper = _reportingSessionConnectivityDelegate.lock();
+  if (helper == nullptr) return true;
+  postAndWait(*helper, *std::move(request), answer);
+  MutexLock lock(answer->mutex);
+  if (answer->data.has_value()) {
+    answered(*answer->data, *extension, path);
+  } else {
+    log().error("UploadBackend(uploadFileAtPath): post {}",
+                answer->error.has_value() ? answer->error->description() : "(null)");
   }
   return true;
 }
 
-std::optional<URLRequest> UploadBackend::newRequest(const String& path, const SandboxExtension& extension) const {
-  CompressedCopy copy = compressedCopyOf(extension, _context.platform().files);
+std::optional<URLRequest> UploadBackend::newRequest(const String& path, const SandboxExtension& extension,
+                                                    const RunningUploads::Place& place) const {
+  CompressedCopy copy =
+      compressedCopyOf(extension, _context.platform().files, [&place] { return place.isCancelled(); });
   if (copy.outcome == CompressedCopy::Outcome::NothingToRead) {
     log().error("UploadBackend(uploadFileAtPath): Input file is empty");
   }
   if (copy.outcome != CompressedCopy::Outcome::Made) return std::nullopt;
   URLRequest request;
   request.url = requestURL(path);
-  if (!isWebURL(request.url)) {
+  // What stands behind a fragment never reaches the server.
+  if (!isWebURL(request.url) || request.url.find('#') != std::string::npos) {
     log().error("UploadBackend(uploadFileAtPath): Unable to create URL request");
     return std::nullopt;
   }
@@ -105,21 +147,19 @@ std::string UploadBackend::requestURL(const String& path) const {
                      percentEncodedForQuery(std::string(lastComponent(path.view())) + ".gz"));
 }
 
-void UploadBackend::post(ReportingSessionConnectivityInterface& helper, URLRequest request, SandboxExtension& extension,
-                         const String& path) const {
-  const auto answer = std::make_shared<ServerAnswer>(_context.platform().dispatch.newSemaphore(0));
+void UploadBackend::postAndWait(ReportingSessionConnectivityInterface& helper, URLRequest request,
+                                const std::shared_ptr<ServerAnswer>& answer) const {
   helper.postURLRequestWithCompletionHandler(
-      std::move(request),
-      [giver = AnswerGiver(answer)](const Data& data, const URLResponse* response,
-                                    const std::optional<Error>& error) mutable { giver.give(data, response, error); });
+      std::move(request), [giver = AnswerGiver<ServerAnswer>(answer)](const Data& data, const URLResponse* response,
+                                                                      const std::optional<Error>& error) mutable {
+        giver.give(data, response, error);
+      });
   answer->semaphore->wait();
-  if (!answer->data.has_value()) {
-    log().error("UploadBackend(uploadFileAtPath): post {}",
-                answer->error.has_value() ? answer->error->description() : "(null)");
-    return;
-  }
-  const std::string_view text = utf8::isValid(answer->data->view()) ? answer->data->view() : "(null)";
-  log().message("UploadBackend(uploadFileAtPath): sending to |{}|, Json output: {}", _uploadURL, text);
+}
+
+void UploadBackend::answered(const Data& data, SandboxExtension& extension, const String& path) const {
+  const std::string_view text = utf8::isValid(data.view()) ? data.view() : "(null)";
+  log().message("UploadBackend(uploadFileAtPath): sending to |{}|, Json output: {}", _uploadURL, loggable(text));
   if (text.find(kSuccess) == std::string_view::npos) return;
   const Result<void> removed = extension.removeFile();
   if (removed.has_error()) {

@@ -6,6 +6,7 @@
 
 #include "backends/TelvaneBackend.h"
 #include "platform/SandboxExtensions.h"
+#include "util/RunningUploads.h"
 
 namespace telvane {
 
@@ -16,6 +17,9 @@ namespace telvane {
 // answered, or until it is clear that it cannot; the answer comes on the connectivity helper's queue, so the caller
 // must be another one. The file is read and compressed into a temporary file first, in pieces; no part of it waits in
 // memory.
+//
+// At most RunningUploads::kMostAtOnce uploads run in the process at once; one more is refused. When the process is to
+// end, those that wait for their server wait no more, and their files stay.
 //
 // A client's file is deleted when the server's answer contains "success", wherever in it, and stays in every other
 // case. docs/upload-protocol.md has the request in bytes.
@@ -32,10 +36,13 @@ class UploadBackend final : public TelvaneBackend {
   UploadBackend(const ProcessContext& context, String name, Dictionary profile, String productFamily, String uploadURL);
 
   // Nothing, with an error line where there is one to write, when the file is refused.
-  std::optional<URLRequest> newRequest(const String& path, const SandboxExtension& extension) const;
+  std::optional<URLRequest> newRequest(const String& path, const SandboxExtension& extension,
+                                       const RunningUploads::Place& place) const;
   std::string requestURL(const String& path) const;
-  void post(ReportingSessionConnectivityInterface& helper, URLRequest request, SandboxExtension& extension,
-            const String& path) const;
+  struct ServerAnswer;
+  void postAndWait(ReportingSessionConnectivityInterface& helper, URLRequest request,
+                   const std::shared_ptr<ServerAnswer>& answer) const;
+  void answered(const Data& data, SandboxExtension& extension, const String& path) const;
 
   const String _uploadURL;
 };

@@ -1,6 +1,12 @@
 #include "client/ReportingQueue.h"
 
 namespace telvane {
+namespace {
+
+// So many that a hop between them costs nothing by comparison.
+constexpr int kRoundsOfARun = 64;
+
+}  // namespace
 
 void ReportingQueue::async(Job step) {
   bool mustSchedule = false;
@@ -54,13 +60,17 @@ void ReportingQueue::scheduleRun() {
 }
 
 void ReportingQueue::run() {
-  for (std::vector<Job> steps = takeWaiting(); !steps.empty(); steps = takeWaiting()) {
+  for (int round = 0; round < kRoundsOfARun; ++round) {
+    std::vector<Job> steps = takeWaiting();
+    if (steps.empty()) return;
     for (Job& step : steps) {
       // Taken out, so that what it holds goes when it is done and not with the whole list.
       Job current = std::move(step);
       current();
     }
   }
+  // Under a load that never ends, other jobs of the serial queue must have their turn.
+  scheduleRun();
 }
 
 std::vector<Job> ReportingQueue::takeWaiting() {

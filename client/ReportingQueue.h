@@ -75,7 +75,7 @@ class ReportingQueue : public std::enable_shared_from_this<ReportingQueue> {
   // Makes the caller the one who sees to the steps; false when somebody is already.
   bool claimRun() REQUIRES(_mutex);
   void scheduleRun();
-  // Runs what waits until nothing does.
+  // Runs what waits until nothing does, with a break now and then.
   void run();
   std::vector<Job> takeWaiting();
   void logDropped(uint64_t messages, uint64_t notices);

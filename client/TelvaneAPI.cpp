@@ -89,6 +89,8 @@ Telvane::PeriodicTaskBlock periodicTaskBlockOf(TelvanePeriodicTaskCallback callb
   return [callback, context](Dictionary* metrics) {
     if (metrics == nullptr) return callback(nullptr, context);
     const OwnedPlist node = ownedPlist(*metrics);
+    // Null would tell the callback that this is no report.
+    if (node.get() == nullptr) throw std::bad_alloc();
     callback(node.get(), context);
     *metrics = metricsOf(node.get());
   };

@@ -20,8 +20,8 @@ namespace telvane {
 // DashboardReceiver::statistics counts). Owned by its program; serves on threads of its own until it is let go of.
 class Collector {
  public:
-  // files: outlives the collector. listener: hears of uploads and datagrams, a line each, from the collector's threads; may be empty.
-  // Fails when the address, the certificate or the event file cannot be used.
+  // files: outlives the collector. listener: hears of uploads and datagrams, a line each, from the collector's threads;
+  // may be empty. Fails when the address, the certificate or the event file cannot be used.
   static Result<std::unique_ptr<Collector>> start(const CollectorOptions& options, FileSystem& files,
                                                   UploadStore::Listener listener = nullptr);
   ~Collector();

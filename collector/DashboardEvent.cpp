@@ -10,6 +10,7 @@ namespace telvane {
 namespace {
 
 constexpr size_t kHeaderLength = 64;
+constexpr size_t kLongestDatagram = 1087;
 constexpr size_t kIdentifierOffset = 20;
 constexpr size_t kIdentifierLength = 40;
 constexpr uint8_t kConstant = 1;
@@ -52,9 +53,21 @@ std::string unescaped(std::string_view value) {
   return result;
 }
 
+// Controls of one byte, and those from U+0080 to U+009F, which terminals obey as well.
+std::string withoutControls(std::string line) {
+  for (size_t at = 0; at < line.size(); ++at) {
+    const auto byte = static_cast<uint8_t>(line[at]);
+    const auto next = static_cast<uint8_t>(at + 1 < line.size() ? line[at + 1] : '\0');
+    if (byte < ' ' || byte == 0x7f) line[at] = '?';
+    if (byte == 0xC2 && next >= 0x80 && next <= 0x9F) line.replace(at, 2, "?");
+  }
+  return line;
+}
+
 }  // namespace
 
 Result<DashboardEvent> DashboardEvent::decode(std::span<const uint8_t> datagram) {
+  if (datagram.size() > kLongestDatagram) return noEvent(fmt::format("{} bytes are too many", datagram.size()));
   if (datagram.size() < kHeaderLength) return noEvent(fmt::format("{} bytes are no header", datagram.size()));
   if (datagram[2] != kConstant) return noEvent(fmt::format("byte 2 is {}, not 1", datagram[2]));
   const uint16_t length = complement(get16(datagram, 14));
@@ -100,9 +113,7 @@ std::string DashboardEvent::line() const {
   std::string line = fmt::format("{}.{:03} {} client type {} session {} event {} method {} status {}{}",
                                  time.wholeSeconds(), time.microseconds() / kMicrosecondsPerMillisecond,
                                  deviceIdentifier, clientType, sessionID, eventID, method, status, text);
-  const auto isControl = [](char c) { return static_cast<unsigned char>(c) < ' ' || c == '\x7f'; };
-  std::replace_if(line.begin(), line.end(), isControl, '?');
-  return line;
+  return withoutControls(std::move(line));
 }
 
 Dictionary dashboardFields(std::string_view text) {
@@ -110,10 +121,10 @@ Dictionary dashboardFields(std::string_view text) {
   std::optional<String> key;
   size_t valueStart = 0;
   for (size_t equals = nextEquals(text, 0); equals != kNothing; equals = nextEquals(text, equals + 1)) {
-    const size_t blank = text.substr(0, equals).rfind(' ');
-    const bool hasBlank = blank != kNothing && blank >= valueStart;
-    const size_t valueEnd = hasBlank ? blank : valueStart;
-    const size_t keyStart = hasBlank ? blank + 1 : valueStart;
+    // No further back than the value begins: the whole text anew for each "=" would take seconds for a hostile one.
+    const size_t blank = text.substr(valueStart, equals - valueStart).rfind(' ');
+    const size_t valueEnd = blank != kNothing ? valueStart + blank : valueStart;
+    const size_t keyStart = blank != kNothing ? valueEnd + 1 : valueStart;
     if (key.has_value()) fields.set(*key, Value(unescaped(text.substr(valueStart, valueEnd - valueStart))));
     key = String(text.substr(keyStart, equals - keyStart));
     valueStart = equals + 1;

@@ -47,11 +47,17 @@ HTTPServer::Response UploadStore::take(Kind kind, const HTTPServer::Request& req
   if (_folder.empty()) return textResponse(kForbidden, "uploads are not taken; start with --uploads FOLDER\n");
   const auto sink = std::dynamic_pointer_cast<Sink>(request.sink);
   if (sink == nullptr) return textResponse(400, "the upload has no body\n");
-  if (sink->file().has_error()) return textResponse(kInternalError, sink->file().error().description() + "\n");
+  if (sink->file().has_error()) return cannotKeep(sink->file().error());
   ReceivedFile& file = **sink->file();
   const Result<std::string> name = file.keepAs(kind == Kind::File ? uploadName(request.target) : kLogDataName);
-  if (name.has_error()) return textResponse(kInternalError, name.error().description() + "\n");
+  if (name.has_error()) return cannotKeep(name.error());
   return kept(kind, request, *name, file.size());
+}
+
+// Devices look for one word in the answer, whatever its status: a name or folder of the text must not bring it in.
+HTTPServer::Response UploadStore::cannotKeep(const Error& error) {
+  if (_listener) _listener("an upload was lost: " + error.description());
+  return textResponse(kInternalError, "the upload cannot be kept\n");
 }
 
 HTTPServer::Response UploadStore::kept(Kind kind, const HTTPServer::Request& request, const std::string& name,

@@ -27,7 +27,8 @@ class UploadStore {
   // Returns what takes the body of the upload; null when there is no folder.
   std::shared_ptr<HTTPServer::BodySink> newSink() const;
   // Keeps what the request's sink has taken, and answers: a file with JSON whose "result" is "success", log data with
-  // the location where they are kept, as text; 403 without a folder, 500 with the reason when they cannot be kept.
+  // the location where they are kept, as text; 403 without a folder, 500 when they cannot be kept (the listener hears
+  // why).
   HTTPServer::Response take(Kind kind, const HTTPServer::Request& request);
 
   uint64_t files() const noexcept { return _files; }
@@ -37,6 +38,7 @@ class UploadStore {
 
  private:
   class Sink;
+  HTTPServer::Response cannotKeep(const Error& error);
   HTTPServer::Response kept(Kind kind, const HTTPServer::Request& request, const std::string& name, uint64_t size);
 
   const std::string _folder;

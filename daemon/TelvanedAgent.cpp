@@ -105,10 +105,19 @@ void TelvanedAgent::uncount(TelvanedSession& session) {
   if (!session.countedClientType().has_value()) return;
   const int32_t clientType = *session.countedClientType();
   uint8_t& counter = _activeClients[static_cast<size_t>(clientType)];
+  session.setCountedClientType(std::nullopt);
   if (counter == 0) return;
   --counter;
   log().info("invalidateReportingSession: active session count for clientType {} got decremented to {}", clientType,
              counter);
+}
+
+// A session whose client is gone is removed behind what it still does, and an upload may take days where there is no
+// network. Its client type must not be locked out for that long.
+void TelvanedAgent::uncountEnded(int32_t clientType) {
+  for (const auto& session : _sessionList) {
+    if (session->countedClientType() == clientType && session->hasConnectionEnded()) uncount(*session);
+  }
 }
 
 void TelvanedAgent::releaseXPCTransactions(uint32_t count) {
@@ -138,6 +147,7 @@ bool TelvanedAgent::isActiveClientLimitReachedForSession(TelvanedSession& sessio
     return true;
   }
   uint8_t& counter = _activeClients[static_cast<size_t>(clientType)];
+  if (counter >= kMaximumActiveSessions) uncountEnded(static_cast<int32_t>(clientType));
   const bool isRefused = counter >= kMaximumActiveSessions;
   if (isRefused) {
     log().error(

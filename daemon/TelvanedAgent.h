@@ -91,6 +91,7 @@ class TelvanedAgent : public TelvanedSessionDelegate,
   // Removes the hierarchies without a session, and their shared data.
   void forgetEmptyHierarchies() REQUIRES(*_monitor);
   void uncount(TelvanedSession& session) REQUIRES(*_monitor);
+  void uncountEnded(int32_t clientType) REQUIRES(*_monitor);
   bool isListed(const CorrelatedSessions& list, const TelvanedSession& session) const;
   CorrelatedSessions* correlatedSessions(const String& token) REQUIRES(*_monitor);
   std::optional<Dictionary> storebagOfFreshRecord(std::string_view name, int32_t clientType, bool& isFetchNeeded)

@@ -81,6 +81,8 @@ void TelvanedAgent::releaseHelper(const std::string& userInfoKey) {
 
 void TelvanedAgent::shutDown() {
   _isShuttingDown = true;
+  // Their sessions still have events to send, which wait behind them.
+  _context.runningUploads().cancelAll();
   std::vector<std::shared_ptr<TelvanedSession>> sessions;
   {
     MonitorLock lock(*_monitor);

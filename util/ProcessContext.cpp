@@ -3,6 +3,7 @@
 namespace telvane {
 namespace {
 
+constexpr uint32_t kMostLingeringDashboards = 64;
 constexpr std::string_view kInternalReleaseType = "Internal";
 constexpr std::string_view kFallbackFrameworkVersion = "8.0";
 
@@ -17,7 +18,8 @@ ProcessContext::ProcessContext(Platform& platform)
     : _platform(platform),
       _isInternalBuild(askIsInternalBuild(platform.deviceAnswers)),
       _processInstanceIdentifier(platform.random.newUUID().string()),
-      _clientFrameworkVersion(platform.clientBundle.version().value_or(String::fromStatic(kFallbackFrameworkVersion))) {
-}
+      _clientFrameworkVersion(platform.clientBundle.version().value_or(String::fromStatic(kFallbackFrameworkVersion))),
+      _runningUploads(std::make_unique<RunningUploads>()),
+      _lingeringDashboards(std::make_unique<Places>(kMostLingeringDashboards)) {}
 
 }  // namespace telvane

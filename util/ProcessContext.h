@@ -2,6 +2,8 @@
 
 #include "foundation/String.h"
 #include "platform/Platform.h"
+#include "util/Places.h"
+#include "util/RunningUploads.h"
 
 namespace telvane {
 
@@ -19,12 +21,18 @@ class ProcessContext {
   const String& processInstanceIdentifier() const noexcept { return _processInstanceIdentifier; }
   // "CFBundleVersion" of the client bundle, "8.0" when it has none.
   const String& clientFrameworkVersion() const noexcept { return _clientFrameworkVersion; }
+  // Of all sessions together.
+  RunningUploads& runningUploads() const noexcept { return *_runningUploads; }
+  // Of dashboards that wait for acknowledgements when their session has gone; each has a socket.
+  Places& lingeringDashboards() const noexcept { return *_lingeringDashboards; }
 
  private:
   Platform& _platform;
   const bool _isInternalBuild;
   const String _processInstanceIdentifier;
   const String _clientFrameworkVersion;
+  const std::unique_ptr<RunningUploads> _runningUploads;
+  const std::unique_ptr<Places> _lingeringDashboards;
 };
 
 }  // namespace telvane

@@ -129,6 +129,11 @@ void TelvanedSession::dealloc() {
   }
 }
 
+bool TelvanedSession::hasConnectionEnded() const {
+  MutexLock lock(_connectionLock);
+  return _connection != nullptr && _connection->hasEnded();
+}
+
 void TelvanedSession::returnTransactionHold() {
   if (_connectivityHelper != nullptr) {
     // The helper gives the hold back when the last posts of its sessions are through.

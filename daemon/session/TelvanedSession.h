@@ -75,6 +75,8 @@ class TelvanedSession : public ClientSessionInterface, public std::enable_shared
   std::optional<String> hierarchyToken() const;
   int32_t hierarchyLevel() const noexcept;
   bool hasAggregator() const noexcept { return _hasAggregator; }
+  // Whether the client is gone already, while the session may still be busy.
+  bool hasConnectionEnded() const EXCLUDES(_connectionLock);
   bool isCounted() const noexcept { return _counted; }
   void setCounted(bool counted) noexcept { _counted = counted; }
   // The client type under which the agent counts this session. Guarded by the agent's lock.
@@ -96,8 +98,9 @@ class TelvanedSession : public ClientSessionInterface, public std::enable_shared
 
   // The estimated bytes that the backends hold in batches.
   uint64_t batchedEventsSize() const;
-  // Adds the session to the report's figures of its client type and returns its batchedEventsSize(). The total so far is
-  // read as a 32-bit number, so one above 2^31 wraps. REQUIRES: the agent's monitor() held, unless it is this session.
+  // Adds the session to the report's figures of its client type and returns its batchedEventsSize(). The total so far
+  // is read as a 32-bit number, so one above 2^31 wraps. REQUIRES: the agent's monitor() held, unless it is this
+  // session.
   uint64_t addSessionHealthInfo(const TelvanedSession& session, Dictionary& healthReport) const;
   // Adds the listed sessions, this one (once more, where it is listed), the storebags and the process's memory.
   void addSessionsAccumulatedHealthInfoToPayload(Dictionary& payload,

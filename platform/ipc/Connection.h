@@ -92,6 +92,9 @@ class Connection {
   virtual bool peerHasEntitlement(const std::string& name) const = 0;
   // The user and groups of the other process when it connected. REQUIRES: accepting side.
   virtual PeerIdentity peerIdentity() const = 0;
+  // Whether the other side has ended the connection, or this one has: true at once, also while the connection's queue
+  // is busy and the handlers that tell of it have to wait. REQUIRES: accepting side.
+  virtual bool hasEnded() const = 0;
   // Names the other end in log lines: "pid 123 (/usr/bin/app)".
   virtual std::string description() const = 0;
 };

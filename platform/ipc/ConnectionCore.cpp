@@ -130,6 +130,7 @@ bool ConnectionCore::hasBeenResumed() {
 }
 
 bool ConnectionCore::becomeInvalid(Life& before) {
+  _hasEnded.store(true, std::memory_order_release);
   MutexLock lock(_mutex);
   before = std::exchange(_life, Life::Invalid);
   return before != Life::Invalid;
@@ -406,6 +407,7 @@ void ConnectionCore::lineDrained() { leave(); }
 
 void ConnectionCore::lineEnded(const std::string& reason) {
   if (!_line) return;
+  if (_path.empty()) _hasEnded.store(true, std::memory_order_release);
   if (!reason.empty()) _parts.log.error("localConnection: connection to {} ended: {}", description(), reason);
   const bool wasNeverAsked = static_cast<bool>(_onAsked);
   auto unanswered = takeEverything();

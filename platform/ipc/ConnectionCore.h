@@ -1,5 +1,6 @@
 #pragma once
 
+#include <atomic>
 #include <functional>
 #include <memory>
 #include <string>
@@ -60,6 +61,7 @@ class ConnectionCore final : public std::enable_shared_from_this<ConnectionCore>
   // Like invalidate(), but runs no handlers any more except those of calls that want an answer.
   void letGo();
   const std::string& description() const noexcept { return _parts.description; }
+  bool hasEnded() const noexcept { return _hasEnded.load(std::memory_order_acquire); }
 
   // LoopResident
   void windDown() override { invalidate(); }
@@ -113,6 +115,8 @@ class ConnectionCore final : public std::enable_shared_from_this<ConnectionCore>
   std::shared_ptr<CallExecutor> _executor;
 
   Outbox _outbox;
+  // Set by whoever notices first, read by any thread.
+  std::atomic<bool> _hasEnded{false};
 
   Mutex _mutex;
   Life _life GUARDED_BY(_mutex) = Life::New;

@@ -63,6 +63,8 @@ PeerIdentity SocketConnection::peerIdentity() const {
   return {_peer.userID, _peer.groupID, {_peer.supplementaryGroups.begin(), _peer.supplementaryGroups.end()}};
 }
 
+bool SocketConnection::hasEnded() const { return _core->hasEnded(); }
+
 std::string SocketConnection::description() const { return _core->description(); }
 
 }  // namespace telvane::ipc

@@ -37,6 +37,7 @@ class SocketConnection final : public Connection {
   void invalidate() override;
   bool peerHasEntitlement(const std::string& name) const override;
   PeerIdentity peerIdentity() const override;
+  bool hasEnded() const override;
   std::string description() const override;
 
  private:

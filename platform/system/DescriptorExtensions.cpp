@@ -1,5 +1,6 @@
 #include "platform/system/DescriptorExtensions.h"
 
+#include <fcntl.h>
 #include <fmt/format.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -33,6 +34,9 @@ class DescriptorExtension final : public SandboxExtension {
 };
 
 bool DescriptorExtension::isRegularFile() const {
+  // A descriptor without the right to read grants nothing.
+  const int flags = ::fcntl(_descriptor, F_GETFL);
+  if (flags < 0 || (flags & O_PATH) != 0 || (flags & O_ACCMODE) == O_WRONLY) return false;
   struct stat ours {};
   struct stat named {};
   if (::fstat(_descriptor, &ours) != 0 || !S_ISREG(ours.st_mode) || ours.st_nlink == 0) return false;

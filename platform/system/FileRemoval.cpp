@@ -4,12 +4,14 @@
 #include <fmt/format.h>
 #include <grp.h>
 #include <sys/fsuid.h>
+#include <sys/statvfs.h>
 #include <sys/syscall.h>
 #include <sys/xattr.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
+#include <cstdlib>
 #include <string_view>
 #include <vector>
 
@@ -101,7 +103,8 @@ class ActingAs {
     if (!_isChanged) return;
     ::setfsuid(::geteuid());
     ::setfsgid(::getegid());
-    ::syscall(SYS_setgroups, _groups.size(), _groups.data());
+    // A worker that kept a client's groups would do the next client's work with them.
+    if (::syscall(SYS_setgroups, _groups.size(), _groups.data()) != 0) std::abort();
   }
   ActingAs(const ActingAs&) = delete;
   ActingAs& operator=(const ActingAs&) = delete;
@@ -158,6 +161,11 @@ Result<void> removeFileFor(const PeerIdentity& who, const std::string& path, int
   const char* name = names.back().c_str();
   struct stat ours {};
   struct stat named {};
+  struct statvfs mount {};
+  // The descriptor knows the mount that the client opened it through, which may be read-only for the client alone.
+  if (::fstatvfs(descriptor, &mount) != 0 || (mount.f_flag & ST_RDONLY) != 0) {
+    return stays(EROFS, "the client may only read there");
+  }
   if (::fstat(descriptor, &ours) != 0) return errnoError(errno, "its descriptor cannot be looked at");
   if (::fstatat(folder->descriptor.get(), name, &named, AT_SYMLINK_NOFOLLOW) != 0) {
     return errnoError(errno, "it cannot be looked up");

@@ -34,12 +34,20 @@ Result<void> ReceivedFile::append(std::string_view bytes) {
   return {};
 }
 
+Result<std::string> ReceivedFile::settled(std::string name) const {
+  const FileDescriptor folder(::open(_folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (!folder.isOpen() || ::fsync(folder.get()) != 0) return errnoError(errno, "Cannot write into " + _folder);
+  return name;
+}
+
 Result<std::string> ReceivedFile::keepAs(const std::string& name) {
   constexpr int kMostOfAName = 100'000;
+  // Who sent it may delete its own copy as soon as it hears that this one is kept.
+  if (::fsync(_file.get()) != 0) return errnoError(errno, "Cannot write into " + _folder);
   std::string kept = name;
   for (int number = 2; number <= kMostOfAName; ++number) {
     // A link, because a rename would replace what has the name.
-    if (::link(_hiddenPath.c_str(), (_folder + "/" + kept).c_str()) == 0) return kept;
+    if (::link(_hiddenPath.c_str(), (_folder + "/" + kept).c_str()) == 0) return settled(kept);
     if (errno != EEXIST) break;
     kept = fmt::format("{}-{}", number, name);
   }

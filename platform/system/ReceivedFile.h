@@ -23,12 +23,16 @@ class ReceivedFile {
 
   Result<void> append(std::string_view bytes);
   uint64_t size() const noexcept { return _size; }
-  // Gives it the name, or "2-NAME", "3-NAME"… when that is taken, and returns which. REQUIRES: the name has no '/'.
+  // Writes it to the disk for good and gives it the name, or "2-NAME", "3-NAME"… when that is taken, and returns which.
+  // REQUIRES: the name has no '/'.
   Result<std::string> keepAs(const std::string& name);
 
  private:
   ReceivedFile(std::string folder, std::string hiddenPath, FileDescriptor file)
       : _folder(std::move(folder)), _hiddenPath(std::move(hiddenPath)), _file(std::move(file)) {}
+
+  // Makes the folder's new entry last, too.
+  Result<std::string> settled(std::string name) const;
 
   const std::string _folder;
   const std::string _hiddenPath;

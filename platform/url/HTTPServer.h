@@ -28,6 +28,8 @@ class HTTPServer {
     std::string privateKeyFile;
     // Answered with 413 and 431 when exceeded; the connection ends. The first holds for bodies that are gathered.
     uint64_t maximumBodyBytes = 64ull << 20;
+    // The same for a body that a sink takes in pieces.
+    uint64_t maximumPiecewiseBodyBytes = 16ull << 30;
     uint32_t maximumHeadBytes = 64u << 10;
     // More are closed at once.
     size_t maximumConnections = 1024;

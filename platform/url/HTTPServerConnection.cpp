@@ -260,7 +260,7 @@ void Connection<Stream>::chooseSink() {
   if (head.sink == nullptr) return;
   _pieceRequest = std::move(head);
   _pieceParser.emplace(std::move(*_parser));
-  _pieceParser->body_limit(boost::none);
+  _pieceParser->body_limit(_server->options.maximumPiecewiseBodyBytes);
   _piece.resize(kPieceBytes);
 }
 

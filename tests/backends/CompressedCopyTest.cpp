@@ -28,7 +28,9 @@ class ScriptedExtension final : public SandboxExtension {
 class CompressedCopyTest : public UploadFixture {
  protected:
   using Outcome = CompressedCopy::Outcome;
-  CompressedCopy copy() { return compressedCopyOf(_file, process().platform().files); }
+  CompressedCopy copy() {
+    return compressedCopyOf(_file, process().platform().files, [this] { return _pieces-- == 0; });
+  }
   // What the copy holds, or "(none)".
   std::string copied() {
     const CompressedCopy made = copy();
@@ -39,6 +41,8 @@ class CompressedCopyTest : public UploadFixture {
     return RecordingConnectivity::bodyText(request);
   }
   ScriptedExtension _file;
+  // After so many pieces it is cancelled.
+  int _pieces = 1'000'000;
 };
 
 TEST_F(CompressedCopyTest, isOfTheFileAsLargeAsItWasAtTheStart) {
@@ -51,6 +55,14 @@ TEST_F(CompressedCopyTest, isOfWhatIsThereWhenTheFileShrinks) {
   _file.content = "0123456789";
   _file.sizeAtTheStart = 4'000'000;
   EXPECT_EQ(copied(), "0123456789");
+}
+
+TEST_F(CompressedCopyTest, endsBetweenPiecesWhenItIsCancelled) {
+  _file.content = std::string(1'000'000, 'x');
+  _file.sizeAtTheStart = _file.content.size();
+  _pieces = 2;
+  EXPECT_EQ(copy().outcome, Outcome::NotMade);
+  EXPECT_EQ(_pieces, -1) << "asked once more after it had said yes, or never";
 }
 
 TEST_F(CompressedCopyTest, isOfEveryPieceOfALargeFile) {

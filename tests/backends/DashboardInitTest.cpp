@@ -198,10 +198,10 @@ TEST_F(DashboardInitTest, staysReliableWithoutAReader) {
   EXPECT_EQ(network().openSockets(), 0u);
 }
 
-// Has no timers.
+// Has no timers, and says so in one of two ways.
 class TimerlessDispatch final : public Dispatch {
  public:
-  explicit TimerlessDispatch(Dispatch& dispatch) : _dispatch(dispatch) {}
+  TimerlessDispatch(Dispatch& dispatch, bool throws) : _dispatch(dispatch), _throws(throws) {}
   std::shared_ptr<SerialQueue> newSerialQueue(std::string label, QualityOfService qos) override {
     return _dispatch.newSerialQueue(std::move(label), qos);
   }
@@ -210,18 +210,22 @@ class TimerlessDispatch final : public Dispatch {
   }
   std::unique_ptr<Timer> newTimer(std::shared_ptr<SerialQueue>, std::chrono::nanoseconds, std::chrono::nanoseconds, Job,
                                   Job) override {
-    throw std::system_error(EAGAIN, std::generic_category());
+    if (_throws) throw std::system_error(EAGAIN, std::generic_category());
+    return nullptr;
   }
   std::shared_ptr<Semaphore> newSemaphore(unsigned count) override { return _dispatch.newSemaphore(count); }
   std::unique_ptr<Monitor> newMonitor() override { return _dispatch.newMonitor(); }
 
  private:
   Dispatch& _dispatch;
+  const bool _throws;
 };
 
-TEST_F(DashboardInitTest, needsATimer) {
+class DashboardWithoutATimerTest : public DashboardInitTest, public ::testing::WithParamInterface<bool> {};
+
+TEST_P(DashboardWithoutATimerTest, isNotMade) {
   const Platform& usual = _process.platform();
-  TimerlessDispatch timerless(usual.dispatch);
+  TimerlessDispatch timerless(usual.dispatch, GetParam());
   Platform platform{usual.clock,
                     usual.random,
                     timerless,
@@ -251,6 +255,9 @@ TEST_F(DashboardInitTest, needsATimer) {
   EXPECT_TRUE(hasLines(log(), 2, line));
   EXPECT_EQ(network().openSockets(), 0u);
 }
+
+INSTANTIATE_TEST_SUITE_P(Ways, DashboardWithoutATimerTest, ::testing::Bool(),
+                         [](const auto& way) { return way.param ? "thrown" : "null"; });
 
 }  // namespace
 }  // namespace telvane::testing

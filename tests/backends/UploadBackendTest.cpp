@@ -247,9 +247,9 @@ TEST_F(UploadBackendTest, refusesInSilenceWhatItHasNoRoomFor) {
 TEST_F(UploadBackendTest, refusesAURLThatNoRequestCanGoTo) {
   const std::string line = "UploadBackend(uploadFileAtPath): Unable to create URL request";
   log().expectError(line);
-  const std::vector<std::string> urls{"https://a b/",   "uploads.example",           "ftp://uploads.example/",
-                                      "https://",       "https://\xC3\xA4.example/", "https://x.example/%zz",
-                                      "https:///upload"};
+  const std::vector<std::string> urls{"https://a b/",    "uploads.example",           "ftp://uploads.example/",
+                                      "https://",        "https://\xC3\xA4.example/", "https://x.example/%zz",
+                                      "https:///upload", "https://x.example/a#b"};
   for (const std::string& url : urls) {
     givenFile("text");
     makeUploadBackend(url);

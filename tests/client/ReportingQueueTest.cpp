@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
+#include <functional>
 #include <thread>
 
 #include "platform/dispatch/ThreadedDispatch.h"
@@ -46,6 +47,20 @@ TEST_F(ReportingQueueTest, runsWaitingStepsOnTheSerialQueue) {
   _queue->async([&] { isOnQueue = _serial->isCurrent(); });
   _world.runUntilIdle();
   EXPECT_TRUE(isOnQueue);
+}
+
+TEST_F(ReportingQueueTest, letsOtherJobsOfItsQueueHaveTheirTurnUnderALoadWithoutAnEnd) {
+  bool hasRun = false;
+  int steps = 0;
+  std::function<void()> step = [&] {
+    if (steps == 0) _serial->async([&] { hasRun = true; });
+    ++steps;
+    if (!hasRun && steps < 10000) _queue->async([&] { step(); });
+  };
+  _queue->async([&] { step(); });
+  _world.runUntilIdle();
+  EXPECT_TRUE(hasRun);
+  EXPECT_LT(steps, 1000) << "steps before the other job's turn";
 }
 
 TEST_F(ReportingQueueTest, runsAStepThatAStepAddsBehindIt) {

@@ -90,6 +90,19 @@ TEST(DashboardEventTest, showsNoControlCharacters) {
   EXPECT_EQ(event->line(), "12.344 ?ev client type 6 session 4711 event 258 method 7 status 2 k=?[2J???");
 }
 
+TEST(DashboardEventTest, showsNoControlsOfTwoBytesEither) {
+  const auto event =
+      DashboardEvent::decode(datagram(" k=\xC2\x9B"
+                                      "2J\xC2\xA0\xC3\x9B"));
+  ASSERT_TRUE(isOk(event));
+  EXPECT_TRUE(event->line().ends_with(" k=?2J\xC2\xA0\xC3\x9B")) << event->line();
+}
+
+TEST(DashboardEventTest, refusesMoreThanADatagramEverHas) {
+  EXPECT_TRUE(isOk(DashboardEvent::decode(datagram(std::string(1023, 'x')))));
+  EXPECT_TRUE(isError(DashboardEvent::decode(datagram(std::string(1024, 'x'))), EBADMSG, "1088 bytes are too many"));
+}
+
 TEST(DashboardEventTest, readsFieldsBack) {
   EXPECT_EQ(dashboardFields(""), Dictionary());
   EXPECT_EQ(dashboardFields(" a=1"), (Dictionary{{Key("a"), "1"}}));
@@ -97,6 +110,8 @@ TEST(DashboardEventTest, readsFieldsBack) {
   EXPECT_EQ(dashboardFields(R"( a=\\ b=\= c=\\\=d)"),
             (Dictionary{{Key("a"), "\\"}, {Key("b"), "="}, {Key("c"), "\\=d"}}));
   EXPECT_EQ(dashboardFields(" a=1 a=2"), (Dictionary{{Key("a"), "2"}}));
+  EXPECT_EQ(dashboardFields("==="), (Dictionary{{Key(""), ""}}));
+  EXPECT_EQ(dashboardFields(" a=b=c"), (Dictionary{{Key("a"), ""}, {Key("b"), "c"}}));
 }
 
 TEST(DashboardEventTest, bearsTextsThatNoSenderMakes) {

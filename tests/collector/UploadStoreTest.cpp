@@ -93,6 +93,18 @@ TEST_F(UploadStoreTest, refusesAnUploadWithoutABodyOrRoom) {
   EXPECT_EQ(nowhere.files(), 0u);
 }
 
+TEST_F(UploadStoreTest, neverSaysTheWordThatDeletesAFileThatIsNotKept) {
+  UploadStore store(_scratch.at("success"), nullptr);
+  HTTPServer::Request request;
+  request.target = "/upload?filename=success.log";
+  request.sink = store.newSink();
+  ASSERT_EQ(request.sink->take("x"), 0);
+  std::filesystem::remove_all(_scratch.at("success"));
+  const auto response = store.take(UploadStore::Kind::File, request);
+  EXPECT_EQ(response.status, 500);
+  EXPECT_EQ(text(response).find("success"), std::string::npos) << text(response);
+}
+
 TEST_F(UploadStoreTest, refusesEverythingWithoutAFolder) {
   UploadStore none("", nullptr);
   EXPECT_EQ(none.newSink(), nullptr);

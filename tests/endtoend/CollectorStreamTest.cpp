@@ -138,7 +138,8 @@ TEST_F(CollectorStreamTest, aConnectionThatBreaksCostsItsEventsOnly) {
   stopDaemon();
   EXPECT_THAT(said, HasSubstr("flushed: error -"));
   EXPECT_THAT(said, ::testing::EndsWith("flushed: ok\nflushed: ok\n"));
-  EXPECT_TRUE(instance().daemonLogHas("HTTPSPostBackend(postJsonMessage): post error: "));
+  EXPECT_TRUE(
+      eventually([this] { return instance().daemonLogHas("HTTPSPostBackend(postJsonMessage): post error: "); }));
   EXPECT_THAT(numbers(), ::testing::ElementsAre(0, 1, 2, 3)) << "and nothing is sent a second time";
 }
 

@@ -58,7 +58,7 @@ TEST_F(HostileSessionsTest, anAggregatorThatIsStoppedHoldsNobodyUp) {
   script.wait().sendMany(kCategory, "child", 1, kLast).flush().wait();
   startUntilWaiting(script, "child");
 
-  client("root").signal(SIGSTOP);
+  client("root").stop();
   client("child").writeLine();
   EXPECT_TRUE(says("child", "waiting", 2)) << output("child");
   EXPECT_EQ(timesSaid("child", "flushed: ok"), static_cast<size_t>(kRounds));
@@ -90,7 +90,7 @@ TEST_F(HostileSessionsTest, aDaemonThatEndsDoesNotWaitForAStoppedAggregator) {
   startDaemon();
   startRoot("root");
   startChild("child", 1, 1, 10);
-  client("root").signal(SIGSTOP);
+  client("root").stop();
   goOn("child");
   stopDaemon();
   EXPECT_EQ(numbersFrom("child"), upTo(10));

@@ -144,7 +144,9 @@ TEST_F(SessionsTogetherTest, aChildIsSampledInAndOutWithItsParent) {
   stopDaemon();
   for (const char* name : {"out", "childOfOut"}) EXPECT_THAT(eventsFrom(name), IsEmpty()) << name;
   for (const char* name : {"in", "childOfIn", "childOfNobody"}) EXPECT_EQ(numbersFrom(name), upTo(1)) << name;
-  EXPECT_TRUE(instance().daemonLogHas("splunk: state and sampling rate updated to 2, 2.00%")) << instance().daemonLog();
+  EXPECT_TRUE(eventually([this] {
+    return instance().daemonLogHas("splunk: state and sampling rate updated to 2, 2.00%");
+  })) << instance().daemonLog();
 }
 
 TEST_F(SessionsTogetherTest, theSixthSessionOfAClientTypeIsCutOffUntilOneOfTheFiveEnds) {

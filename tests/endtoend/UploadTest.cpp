@@ -49,6 +49,16 @@ class UploadTest : public ::testing::Test {
     bag.set(kEnvironmentRelease, section);
     instance.givenStorebag("conferencing", bag);
   }
+  // The daemon writes its log behind what it does.
+  bool isLogged(const std::string& text) {
+    return eventually([this, &text] { return instance.daemonLogHas(text); });
+  }
+  size_t refusalsInTheLog() const {
+    const std::string log = instance.daemonLog();
+    size_t lines = 0;
+    for (size_t at = log.find(kOnlyRegular); at != std::string::npos; at = log.find(kOnlyRegular, at + 1)) ++lines;
+    return lines;
+  }
   static std::vector<std::string> arguments(const std::string& file) {
     return {"upload", "--client-type", "7", "--client-name", "sender", file};
   }
@@ -116,13 +126,11 @@ TEST_F(UploadTest, refusesALinkAFolderAPipeAndAnEmptyFile) {
   for (const char* name : {"link", "folder", "pipe"}) {
     EXPECT_EQ(upload(instance.path(name)), 1) << name;
     EXPECT_THAT(complained(), HasSubstr("the daemon refused " + instance.path(name)));
-    const std::string log = instance.daemonLog();
-    size_t lines = 0;
-    for (size_t at = log.find(kOnlyRegular); at != std::string::npos; at = log.find(kOnlyRegular, at + 1)) ++lines;
-    EXPECT_EQ(lines, ++refusals) << name;
+    ++refusals;
+    EXPECT_TRUE(eventually([this, refusals] { return refusalsInTheLog() == refusals; })) << name;
   }
   EXPECT_EQ(upload(write("empty", "")), 1);
-  EXPECT_TRUE(instance.daemonLogHas("UploadBackend(uploadFileAtPath): Input file is empty"));
+  EXPECT_TRUE(isLogged("UploadBackend(uploadFileAtPath): Input file is empty"));
   EXPECT_TRUE(fs::exists(target));
   EXPECT_TRUE(fs::exists(instance.path("empty")));
   EXPECT_EQ(arrivedFiles(), 0u);
@@ -154,7 +162,7 @@ TEST_F(UploadTest, aDaemonThatMayEverythingDeletesNothingThatTheClientCouldNot) 
   EXPECT_EQ(arrived("log.gz"), "readable for all");
   EXPECT_TRUE(fs::exists(file));
   EXPECT_THAT(said(), HasSubstr("posted: " + file + "; it is still there"));
-  EXPECT_TRUE(instance.daemonLogHas("The uploaded file " + file + " stays: the client may not delete it"));
+  EXPECT_TRUE(isLogged("The uploaded file " + file + " stays: the client may not delete it"));
 }
 
 TEST_F(UploadTest, aClientHasNothingReadThatItMayNotReadItself) {
@@ -186,10 +194,10 @@ TEST_F(UploadTest, aDaemonOfAnotherUserReadsThroughTheDescriptorAndDeletesNothin
   EXPECT_EQ(uploadAs(kNobody, file), 0) << complained() << instance.daemonLog();
   EXPECT_EQ(arrived("log.gz"), "mine");
   EXPECT_TRUE(fs::exists(file));
-  EXPECT_TRUE(instance.daemonLogHas("The uploaded file " + file + " stays: ")) << instance.daemonLog();
+  EXPECT_TRUE(isLogged("The uploaded file " + file + " stays: ")) << instance.daemonLog();
   fs::create_symlink(file, instance.path("private/link"));
   EXPECT_EQ(uploadAs(kNobody, instance.path("private/link")), 1);
-  EXPECT_TRUE(instance.daemonLogHas(kOnlyRegular));
+  EXPECT_TRUE(isLogged(kOnlyRegular));
 }
 
 // As much as a test of a daemon that held the file, or its compressed form, would show by far.
@@ -223,6 +231,9 @@ class UploadOverTheWireTest : public WireFixture {
     section.set("upload_server", Dictionary{{kProfilePostURL, server().url("/upload")}});
     givenSection(section);
     startDaemon();
+  }
+  bool isLogged(const std::string& text) {
+    return eventually([this, &text] { return instance().daemonLogHas(text); });
   }
   ClientScript configured() const {
     ClientScript script;
@@ -286,7 +297,7 @@ TEST_F(UploadOverTheWireTest, aLinkThatTakesTheFilesPlaceAfterTheCallIsRefused) 
     return eventually([this, text] { return instance().read("client.out").find(text) != std::string::npos; });
   };
   ASSERT_TRUE(hasSaid("waiting"));
-  instance().daemon().signal(SIGSTOP);
+  instance().daemon().stop();
   client->writeLine();
   const bool isHandedOver = hasSaid("handed over: yes");
   fs::remove(file);
@@ -295,7 +306,7 @@ TEST_F(UploadOverTheWireTest, aLinkThatTakesTheFilesPlaceAfterTheCallIsRefused) 
   ASSERT_TRUE(isHandedOver);
   EXPECT_TRUE(hasSaid("uploaded: no"));
   expectEnd(*client);
-  EXPECT_TRUE(instance().daemonLogHas(kOnlyRegular));
+  EXPECT_TRUE(isLogged(kOnlyRegular));
   EXPECT_EQ(uploads().size(), 0u);
   EXPECT_TRUE(fs::exists(other));
 }

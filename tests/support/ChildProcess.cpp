@@ -6,6 +6,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <stdexcept>
 #include <thread>
 #include <utility>
@@ -61,6 +62,14 @@ ChildProcess::~ChildProcess() {
 
 void ChildProcess::signal(int number) {
   if (_pid > 0) kill(_pid, number);
+}
+
+void ChildProcess::stop() {
+  signal(SIGSTOP);
+  siginfo_t info{};
+  while (_pid > 0 && waitid(P_PID, static_cast<id_t>(_pid), &info, WSTOPPED | WEXITED | WNOWAIT) != 0 &&
+         errno == EINTR) {
+  }
 }
 
 void ChildProcess::writeLine() {

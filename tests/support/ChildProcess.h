@@ -25,6 +25,8 @@ class ChildProcess {
 
   pid_t pid() const noexcept { return _pid; }
   void signal(int number);
+  // Stops it, and returns once all its threads stand still. SIGCONT lets it go on.
+  void stop();
   // Writes an empty line to its standard input; does nothing when it has ended.
   void writeLine();
   void closeInput();

@@ -32,6 +32,7 @@ class SimulatedConnectionEnd final : public std::enable_shared_from_this<Simulat
   void invalidate();
   bool peerHasEntitlement(const std::string& name) const;
   PeerIdentity peerIdentity() const;
+  bool hasEnded() const noexcept { return _state == State::Invalid || _isDeaf; }
   std::string description() const;
   // The handle is gone: like invalidate(), but the handlers are not called.
   void letGo();

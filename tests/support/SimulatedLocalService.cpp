@@ -26,6 +26,8 @@ void SimulatedConnection::invalidate() { _end->invalidate(); }
 
 PeerIdentity SimulatedConnection::peerIdentity() const { return _end->peerIdentity(); }
 
+bool SimulatedConnection::hasEnded() const { return _end->hasEnded(); }
+
 bool SimulatedConnection::peerHasEntitlement(const std::string& name) const { return _end->peerHasEntitlement(name); }
 
 std::string SimulatedConnection::description() const { return _end->description(); }

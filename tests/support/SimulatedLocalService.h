@@ -23,6 +23,7 @@ class SimulatedConnection final : public ipc::Connection {
   void invalidate() override;
   bool peerHasEntitlement(const std::string& name) const override;
   PeerIdentity peerIdentity() const override;
+  bool hasEnded() const override;
   std::string description() const override;
 
  private:

@@ -38,10 +38,10 @@ TELVANE_API void TelvaneStartConfiguration(TelvaneRef session, TelvaneBackendsCa
 typedef void (*TelvanePeriodicTaskCallback)(plist_t metrics, void* context);
 
 /* Registers a module, behind what was called before, and instead of an earlier one of that number. needToUpdate: call
- * it at ticks that are no report; needToReport: call it for reports. A report goes without what cannot be carried, and
- * an error line tells of it. The context must stay usable until the module is unregistered or replaced, or the session
- * released, and a tick that is then under way is over; see TelvaneUnregisterPeriodTaskForModule. Returns false for a
- * null callback, else true. */
+ * it at ticks that are no report; needToReport: call it for reports. A report goes without a module whose metrics
+ * cannot be carried, and an error line tells of it. The context must stay usable until the module is unregistered or
+ * replaced, or the session released, and a tick that is then under way is over; see
+ * TelvaneUnregisterPeriodTaskForModule. Returns false for a null callback, else true. */
 TELVANE_API bool TelvaneRegisterPeriodicTaskForModule(TelvaneRef session, uint32_t module, bool needToUpdate,
                                                       bool needToReport, TelvanePeriodicTaskCallback callback,
                                                       void* context);

@@ -91,6 +91,17 @@ TEST_F(TelvanedSessionDashboardTest, aOneShotMessageInTheMidstOfASessionLeavesNo
   EXPECT_EQ(world.datagrams().openSockets(), 0u);
 }
 
+TEST_F(TelvanedSessionDashboardTest, aCrowdOfOneShotMessagesDoesNotTakeAllSockets) {
+  givenSection(onlyADashboard());
+  auto client = connect();
+  constexpr int kCrowd = 100;
+  for (int n = 0; n < kCrowd; ++n) client->sendOneMessage(sessionInfo(), userInfo(), Dictionary());
+  EXPECT_EQ(world.datagrams().openSockets(), 65u) << "64 that wait for acknowledgements, and the last one";
+  client.reset();
+  world.advance(std::chrono::seconds(30));
+  EXPECT_EQ(world.datagrams().openSockets(), 0u);
+}
+
 TEST_F(TelvanedSessionDashboardTest, theEndOfASessionIsSentAgainUntilItIsAcknowledgedButHoldsNoTransaction) {
   givenSection(onlyADashboard());
   // Without names there is no connectivity helper, which would hold one for its own reasons.

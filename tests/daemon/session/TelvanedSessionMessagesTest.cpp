@@ -243,6 +243,60 @@ TEST_F(TelvanedSessionUploadTest, otherSessionsGoOnWhileOneWaitsForItsServer) {
   EXPECT_EQ((*upload)[0], Value(true));
 }
 
+TEST_F(TelvanedSessionUploadTest, clientsThatAreGoneDoNotLockTheirTypeOutWhileTheirUploadsRun) {
+  world.network().answer(kUploadURL, NetworkAnswer::silence());
+  constexpr int kMost = 5;
+  for (int i = 0; i < kMost; ++i) {
+    const auto client = startSession();
+    client->uploadInPassing("file:///tmp/a%20log", token());
+    world.runUntilIdle();
+  }
+  EXPECT_EQ(world.network().countTo(kUploadURL), static_cast<size_t>(kMost));
+  EXPECT_EQ(sessions().size(), static_cast<size_t>(kMost)) << "they wait for their servers";
+  EXPECT_FALSE(openSession()->isInvalidated());
+  service->shutDown();
+  log().expectError("UploadBackend(uploadFileAtPath): post (null)");
+  world.advance(std::chrono::minutes(2));
+  EXPECT_EQ(sessions().size(), 0u);
+  EXPECT_TRUE(hasNoLine(log(), "got decremented to 255"));
+}
+
+TEST_F(TelvanedSessionUploadTest, theDaemonsEndWaitsForNoServerAndStillSendsTheSessionsEvents) {
+  world.network().answer(kUploadURL, NetworkAnswer::silence());
+  const auto client = startSession();
+  client->send(7);
+  const auto upload = client->uploadInPassing("file:///tmp/a%20log", token());
+  world.runUntilIdle();
+  ASSERT_FALSE(upload->values.has_value());
+  log().expectError("UploadBackend(uploadFileAtPath): post (null)");
+  service->shutDown();
+  world.advance(std::chrono::seconds(1));
+  EXPECT_EQ(postedEvents(7, 1).size(), 1u);
+  EXPECT_EQ(sessions().size(), 0u);
+  EXPECT_TRUE(process.files().exists("/tmp/a log"));
+}
+
+TEST_F(TelvanedSessionUploadTest, moreUploadsAtOnceThanThereArePlacesAreRefused) {
+  world.network().answer(kUploadURL, NetworkAnswer::silence());
+  std::vector<std::unique_ptr<DaemonClient>> clients;
+  std::vector<std::shared_ptr<Answer>> answers;
+  for (size_t i = 0; i <= RunningUploads::kMostAtOnce; ++i) {
+    clients.push_back(startSession(sessionInfo(kClientType, static_cast<uint32_t>(i))));
+    answers.push_back(clients.back()->uploadInPassing("file:///tmp/a%20log", token()));
+    if (i == RunningUploads::kMostAtOnce) {
+      log().expectError("UploadBackend(uploadFileAtPath): Too much is being uploaded already");
+      log().expectError("uploadFileWithURL: File upload failed for /tmp/a log");
+    }
+    world.runUntilIdle();
+    clients.back()->close();
+  }
+  EXPECT_EQ(world.network().countTo(kUploadURL), RunningUploads::kMostAtOnce);
+  EXPECT_TRUE(hasLines(log(), 1, "Too much is being uploaded already"));
+  log().expectError("UploadBackend(uploadFileAtPath): post (null)");
+  service->shutDown();
+  world.advance(std::chrono::seconds(1));
+}
+
 TEST_F(TelvanedSessionMessagesTest, anUploadIsOfThePathThatTheURLNames) {
   const auto client = openSession();
   for (const char* url : {"file:///tmp/a%20log", "file://localhost/tmp/a%20log", "file:///tmp/a%20log?x#y"}) {
