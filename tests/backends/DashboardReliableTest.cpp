@@ -387,7 +387,7 @@ TEST_F(DashboardReliableTest, holdsATransactionUntilEachEventWasTriedOnce) {
   EXPECT_EQ(transactions.surplusEnds(), 0);
 }
 
-TEST_F(DashboardReliableTest, isTheSameInEveryRunAndOrder) {
+TEST_F(DashboardReliableTest, repeatsNothingThatWasAcknowledgedInWhateverOrder) {
   _world.scheduler().setInterleaving(SimulatedScheduler::Interleaving::AtCalls);
   dashboard().onArrival([this](const auto& arrival) {
     const uint16_t eventID = eventIDOf(arrival.bytes);

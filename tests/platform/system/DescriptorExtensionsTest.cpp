@@ -3,6 +3,8 @@
 #include <fcntl.h>
 #include <grp.h>
 #include <gtest/gtest.h>
+#include <sched.h>
+#include <sys/mount.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -272,6 +274,30 @@ TEST_F(FileRemovalForAClientTest, isWhatTheKernelLetsTheClientDoItself) {
       }
     }
   }
+}
+
+// A container, or a service that may only read its home: the client's view of the disks is not the daemon's.
+TEST_F(FileRemovalForAClientTest, keepsWhatTheClientMayOnlyReadInItsOwnViewOfTheDisks) {
+  makeFolder("place", kClient, kClient, 0700);
+  makeFolder("view", 0, 0, 0755);
+  const std::string path = makeFile("place/log", kClient);
+  const std::string place = _folder.at("place");
+  const std::string view = _folder.at("view");
+  constexpr int kNoView = 2;
+  const int answer = as(0, [&] {
+    const bool isMounted = ::unshare(CLONE_NEWNS) == 0 &&
+                           ::mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr) == 0 &&
+                           ::mount(place.c_str(), view.c_str(), nullptr, MS_BIND, nullptr) == 0 &&
+                           ::mount(nullptr, view.c_str(), nullptr, MS_BIND | MS_REMOUNT | MS_RDONLY, nullptr) == 0;
+    if (!isMounted) return kNoView;
+    const FileDescriptor file(::open((view + "/log").c_str(), O_RDONLY | O_CLOEXEC));
+    const ExtensionToken token{file.get(), PeerIdentity{kClient, kClient, {}}};
+    return _extensions.consume(path, token)->removeFile().has_value() ? 1 : 0;
+  });
+  if (answer == kNoView) GTEST_SKIP() << "no mounts of its own here";
+  EXPECT_EQ(answer, 0);
+  EXPECT_TRUE(fs::exists(path));
+  EXPECT_TRUE(removes(path)) << "the same file, seen as the daemon sees it";
 }
 
 TEST_F(FileRemovalForAClientTest, leavesTheDaemonWithItsOwnRights) {
