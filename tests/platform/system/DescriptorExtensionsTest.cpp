@@ -296,7 +296,7 @@ TEST_F(FileRemovalForAClientTest, keepsWhatTheClientMayOnlyReadInItsOwnViewOfThe
   });
   if (answer == kNoView) GTEST_SKIP() << "no mounts of its own here";
   EXPECT_EQ(answer, 0);
-  EXPECT_TRUE(fs::exists(path));
+  ASSERT_TRUE(fs::exists(path));
   EXPECT_TRUE(removes(path)) << "the same file, seen as the daemon sees it";
 }
 
