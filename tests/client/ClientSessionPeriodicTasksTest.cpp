@@ -46,6 +46,9 @@ class ClientSessionPeriodicTasksTest : public ClientFixture {
   ~ClientSessionPeriodicTasksTest() override {
     if (_session != nullptr) _session->stopLogTimer();
     run();
+    // Its last steps run while the process still does.
+    _session.reset();
+    run();
   }
 
   // A block that notes when it is called, in milliseconds since the start, and then does what the test says.

@@ -229,6 +229,9 @@ TEST_F(SystemDatagramSocketTest, closesNothingTooEarlyWhenManySourcesComeAndGo) 
 }
 
 TEST_F(SystemDatagramSocketTest, makesNoSocketWithoutDescriptors) {
+#ifdef __SANITIZE_ADDRESS__
+  GTEST_SKIP() << "the sanitizers need descriptors of their own when they meet a type for the first time";
+#endif
   rlimit limit{};
   ASSERT_EQ(getrlimit(RLIMIT_NOFILE, &limit), 0);
   rlimit none = limit;
