@@ -74,11 +74,11 @@ class SystemDatagramSocketTest : public ::testing::Test {
   Dispatch& _dispatch = _threads;
   const std::shared_ptr<SerialQueue> _queue = _dispatch.newSerialQueue("reader");
   SystemDatagramSockets _sockets;
-  std::unique_ptr<DatagramServer> _server;
   std::unique_ptr<DatagramSocket> _socket;
   Mutex _mutex;
   IPv4SocketAddress _peer GUARDED_BY(_mutex);
   std::vector<std::string> _datagrams GUARDED_BY(_mutex);
+  std::unique_ptr<DatagramServer> _server;  // last, so that it ends first: its thread writes what is above
 };
 
 TEST_F(SystemDatagramSocketTest, sendsWholeDatagrams) {
