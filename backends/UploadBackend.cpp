@@ -110,12 +110,18 @@ bool UploadBackend::uploadFileAtPath(const String& path, const ExtensionToken& e
   const auto helper = _reportingSessionConnectivityDelegate.lock();
   if (helper == nullptr) return true;
   postAndWait(*helper, *std::move(request), answer);
-  MutexLock lock(answer->mutex);
-  if (answer->data.has_value()) {
-    answered(*answer->data, *extension, path);
+  // Taken out: an answer that comes after the wait was given up must not wait for what is done with it here.
+  std::optional<Data> data;
+  std::optional<Error> error;
+  {
+    MutexLock lock(answer->mutex);
+    data = std::move(answer->data);
+    error = std::move(answer->error);
+  }
+  if (data.has_value()) {
+    answered(*data, *extension, path);
   } else {
-    log().error("UploadBackend(uploadFileAtPath): post {}",
-                answer->error.has_value() ? answer->error->description() : "(null)");
+    log().error("UploadBackend(uploadFileAtPath): post {}", error.has_value() ? error->description() : "(null)");
   }
   return true;
 }
