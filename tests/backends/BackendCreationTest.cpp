@@ -4,6 +4,7 @@
 #include "interfaces/SessionKeys.h"
 #include "interfaces/StorebagKeys.h"
 #include "tests/backends/BackendFixture.h"
+#include "tests/support/PlatformWith.h"
 
 namespace telvane::testing {
 namespace {
@@ -156,27 +157,8 @@ TEST_F(BackendCreationTest, withoutABundleTheFrameworkIsVersionEight) {
 }
 
 TEST_F(BackendCreationTest, allBackendsOfACallStartAtTheSameTime) {
-  const Platform& base = process().platform();
   TickingClock clock;
-  Platform ticking{clock,
-                   base.random,
-                   base.dispatch,
-                   base.log,
-                   base.files,
-                   base.userDefaults,
-                   base.deviceAnswers,
-                   base.locale,
-                   base.consent,
-                   base.clientBundle,
-                   base.urlSessions,
-                   base.transactions,
-                   base.localService,
-                   base.submittableLogs,
-                   base.processMemory,
-                   base.datagramSockets,
-                   base.sandboxExtensions,
-                   base.wirelessDiagnostics,
-                   base.powerLog};
+  Platform ticking = platformWith(process().platform(), clock);
   const ProcessContext tickingContext{ticking};
   const Dictionary both{{Key("splunk"), profile()}, {Key("gonzo"), profile()}};
   const auto table = createBackends(tickingContext, both, _sessionInfo, _userInfo, "device-id");

@@ -5,33 +5,9 @@
 #include "interfaces/DefaultsKeys.h"
 #include "interfaces/SessionKeys.h"
 #include "interfaces/StorebagKeys.h"
+#include "tests/support/PlatformWith.h"
 
 namespace telvane::testing {
-namespace {
-
-Platform withRandom(const Platform& platform, Random& random) {
-  return {platform.clock,
-          random,
-          platform.dispatch,
-          platform.log,
-          platform.files,
-          platform.userDefaults,
-          platform.deviceAnswers,
-          platform.locale,
-          platform.consent,
-          platform.clientBundle,
-          platform.urlSessions,
-          platform.transactions,
-          platform.localService,
-          platform.submittableLogs,
-          platform.processMemory,
-          platform.datagramSockets,
-          platform.sandboxExtensions,
-          platform.wirelessDiagnostics,
-          platform.powerLog};
-}
-
-}  // namespace
 
 void DrawnRandom::fill(std::span<uint8_t> bytes) {
   constexpr uint32_t kAboveBias = 10000;  // the lowest values are drawn again
@@ -51,7 +27,7 @@ BackendFixture::BackendFixture()
               {kClientEntryRealtimePostURL, kRealtimeURL}},
       _userInfo(Dictionary{{kTelvaneUserInfoClientName, "player"}, {kTelvaneUserInfoServiceName, "StreamMediaPlayer"}}),
       _process(_world.makeProcess("telvaned")),
-      _platform(withRandom(_process.platform(), _random)) {}
+      _platform(platformWith(_process.platform(), _random)) {}
 
 BackendFixture::~BackendFixture() { _world.end(); }
 

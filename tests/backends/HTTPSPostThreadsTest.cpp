@@ -7,6 +7,7 @@
 #include "platform/dispatch/SystemClock.h"
 #include "platform/dispatch/ThreadedDispatch.h"
 #include "tests/backends/BackendFixture.h"
+#include "tests/support/PlatformWith.h"
 
 namespace telvane::testing {
 namespace {
@@ -37,32 +38,10 @@ class HTTPSPostThreadsTest : public BackendFixture {
     ASSERT_TRUE(_allStopped->waitFor(std::chrono::seconds(60))) << "the other threads do not end";
   }
 
-  Platform threadedPlatform(const Platform& base) {
-    return {_clock,
-            base.random,
-            _dispatch,
-            _log,
-            base.files,
-            base.userDefaults,
-            base.deviceAnswers,
-            base.locale,
-            base.consent,
-            base.clientBundle,
-            base.urlSessions,
-            base.transactions,
-            base.localService,
-            base.submittableLogs,
-            base.processMemory,
-            base.datagramSockets,
-            base.sandboxExtensions,
-            base.wirelessDiagnostics,
-            base.powerLog};
-  }
-
   SystemClock _clock;
   RecordingLog _log{nullptr, "test", LogLevel::Error};
   ThreadedDispatch _dispatch;
-  Platform _threaded = threadedPlatform(process().platform());
+  Platform _threaded = platformWith(process().platform(), _clock, _log, _dispatch);
   ProcessContext _threadedContext{_threaded};
   std::shared_ptr<RecordingConnectivity> _helper = std::make_shared<RecordingConnectivity>();
   std::shared_ptr<ConcurrentQueue> _queue = _dispatch.newConcurrentQueue("others", QualityOfService::Default);

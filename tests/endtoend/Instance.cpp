@@ -1,5 +1,7 @@
 #include "tests/endtoend/Instance.h"
 
+#include <gtest/gtest.h>
+
 #include <signal.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -61,7 +63,21 @@ Instance::Instance() : _certificates(_scratch.path()), _key(crypto::PrivateKey::
   grant("telvane-event-sender");
 }
 
-Instance::~Instance() = default;
+Instance::~Instance() {
+  _daemon.reset();
+  _collector.reset();
+  expectNoSanitizerReports();
+}
+
+void Instance::expectNoSanitizerReports() const {
+  for (const auto& entry : std::filesystem::directory_iterator(_scratch.path())) {
+    if (entry.path().extension() != ".err") continue;
+    const std::string written = _scratch.read(entry.path().filename().string());
+    for (const char* mark : {"Sanitizer:", ": runtime error: "}) {
+      EXPECT_EQ(written.find(mark), std::string::npos) << entry.path().filename() << " has a report:\n" << written;
+    }
+  }
+}
 
 void Instance::writeBundle() {
   Dictionary info;

@@ -12,6 +12,7 @@
 #include "platform/system/FolderSubmittableLogs.h"
 #include "platform/system/PosixFileSystem.h"
 #include "tests/support/Matchers.h"
+#include "tests/support/PlatformWith.h"
 #include "tests/support/ScratchFolder.h"
 #include "tests/support/SimulatedWorld.h"
 #include "util/MessageLogFile.h"
@@ -62,26 +63,7 @@ class MessageLogFileThreadsTest : public ::testing::Test {
   }
   // Of the system: files, threads and the clock that is given.
   Platform realFilesPlatform(Clock& clock) {
-    const Platform& base = world.makeProcess("telvaned").platform();
-    return Platform{clock,
-                    base.random,
-                    dispatch,
-                    log,
-                    files,
-                    base.userDefaults,
-                    base.deviceAnswers,
-                    base.locale,
-                    base.consent,
-                    base.clientBundle,
-                    base.urlSessions,
-                    base.transactions,
-                    base.localService,
-                    submittableLogs,
-                    base.processMemory,
-                    base.datagramSockets,
-                    base.sandboxExtensions,
-                    base.wirelessDiagnostics,
-                    base.powerLog};
+    return platformWith(world.makeProcess("telvaned").platform(), clock, dispatch, log, files, submittableLogs);
   }
   // The messages of all lines of all files of the folder, which must be whole; how often each came.
   std::map<std::string, int> messagesIn(const std::string& path) {
