@@ -20,8 +20,8 @@ namespace telvane::testing {
 class Instance {
  public:
   Instance();
-  // Fails the test when a sanitizer has reported something of one of the processes. A report does not end a process, and
-  // what a test waits for may come all the same.
+  // Aborts the program when a sanitizer has reported something of one of the processes: a report alone ends none of
+  // them, and what a test waits for may come all the same.
   ~Instance();
 
   // Configuration; to be given before the process that reads it starts.
@@ -84,7 +84,8 @@ class Instance {
   std::vector<std::string> environment() const;
   void waitForDaemon(size_t logSizeBefore);
   void writeBundle();
-  void expectNoSanitizerReports() const;
+  // What the processes have written that holds a report; empty when there is none.
+  std::string sanitizerReports() const;
 
   ScratchFolder _scratch;
   TestCertificates _certificates;
