@@ -15,7 +15,6 @@
 #include <chrono>
 #include <cstdio>
 #include <cstdlib>
-#include <future>
 #include <stdexcept>
 #include <string>
 #include <thread>
@@ -23,6 +22,7 @@
 
 #include "bench/ArrivalServer.h"
 #include "bench/BenchEvent.h"
+#include "bench/ConfiguredSession.h"
 #include "bench/KeptConnection.h"
 #include "bench/Measurement.h"
 #include "bench/RoadBag.h"
@@ -46,21 +46,6 @@ struct Times {
   Samples bare;
   Samples answered;
 };
-
-std::shared_ptr<Telvane> openSession(int clientType) {
-  const Dictionary sessionInfo{
-      {"ComponentType", clientType}, {"ClientVersion", 1}, {"SessionID", 1}, {"RequireUserDict", true}};
-  const Dictionary userInfo{{"_clientName", "bench"}, {"_serviceName", "realtime"}};
-  auto session = Telvane::initWithSessionInfo(sessionInfo, userInfo);
-  if (session == nullptr) throw std::runtime_error("there is no session");
-  auto configured = std::make_shared<std::promise<bool>>();
-  std::future<bool> isEnabled = configured->get_future();
-  session->startConfigurationWithCompletionHandler([configured = std::move(configured)](const Value& names) {
-    configured->set_value(names.array() != nullptr && names.array()->size() > 0);
-  });
-  if (!isEnabled.get()) throw std::runtime_error("no backend is enabled");
-  return session;
-}
 
 // The request of the event with this number. What a session says of itself is posted, too, and is let pass.
 ArrivalServer::Arrival arrivalOf(ArrivalServer& server, uint64_t number) {
@@ -144,7 +129,8 @@ void run(int argc, char** argv) {
   std::fflush(stdout);
   while (std::getchar() != EOF) {
   }
-  const auto session = openSession(clientType);
+  const auto session = bench::newConfiguredSession(
+      {{"ComponentType", clientType}, {"ClientVersion", 1}, {"SessionID", 1}, {"RequireUserDict", true}}, "realtime");
   Comparison comparison(server, *session, bench::option(argc, argv, "ca", ""));
   Times warmUp;
   Times times;

@@ -18,6 +18,7 @@
 #include <vector>
 
 #include "bench/BenchEvent.h"
+#include "bench/ConfiguredSession.h"
 #include "bench/Measurement.h"
 #include "bench/RoadBag.h"
 
@@ -34,21 +35,12 @@ struct Sender {
 };
 
 std::shared_ptr<Telvane> openSession(int clientType, uint64_t number) {
-  const Dictionary sessionInfo{{"ComponentType", clientType},
-                               {"ClientVersion", 1},
-                               {"SessionID", number},
-                               {"BatchEvents", true},
-                               {"RequireUserDict", true}};
-  const Dictionary userInfo{{"_clientName", "bench"}, {"_serviceName", "road"}};
-  auto session = Telvane::initWithSessionInfo(sessionInfo, userInfo);
-  if (session == nullptr) throw std::runtime_error("there is no session");
-  auto configured = std::make_shared<std::promise<bool>>();
-  std::future<bool> isEnabled = configured->get_future();
-  session->startConfigurationWithCompletionHandler([configured = std::move(configured)](const Value& names) {
-    configured->set_value(names.array() != nullptr && names.array()->size() > 0);
-  });
-  if (!isEnabled.get()) throw std::runtime_error("no backend is enabled");
-  return session;
+  return bench::newConfiguredSession({{"ComponentType", clientType},
+                                      {"ClientVersion", 1},
+                                      {"SessionID", number},
+                                      {"BatchEvents", true},
+                                      {"RequireUserDict", true}},
+                                     "road");
 }
 
 void flush(Sender& sender) {

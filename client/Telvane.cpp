@@ -2,6 +2,7 @@
 
 #include "client/ClientRuntime.h"
 #include "client/ClientSession.h"
+#include "client/Guarded.h"
 #include "client/HierarchyToken.h"
 #include "client/TelvaneFactory.h"
 #include "interfaces/TelvaneErrors.h"
@@ -9,25 +10,6 @@
 
 namespace telvane {
 namespace {
-
-// Runs the call and returns what it returns, or the fallback when it throws: for lack of memory or threads, and then
-// the host goes on without telemetry.
-template <class Result, class Call>
-Result guarded(Result fallback, Call&& call) noexcept {
-  try {
-    return call();
-  } catch (...) {
-    return fallback;
-  }
-}
-
-template <class Call>
-void guarded(Call&& call) noexcept {
-  try {
-    call();
-  } catch (...) {
-  }
-}
 
 Error foreignSessionError() {
   return makeTelvaneError("The session belongs to the process that this one was forked from",

@@ -4,6 +4,7 @@
 #include <stdexcept>
 #include <string>
 
+#include "client/Guarded.h"
 #include "client/include/telvane/Telvane.h"
 #include "client/include/telvane/TelvaneSession.h"
 #include "interfaces/TelvaneErrors.h"
@@ -12,6 +13,7 @@
 using telvane::Array;
 using telvane::Dictionary;
 using telvane::Error;
+using telvane::guarded;
 using telvane::String;
 using telvane::Telvane;
 using telvane::Value;
@@ -30,24 +32,6 @@ struct TelvaneErrorOpaque {
 };
 
 namespace {
-
-// What is thrown here is for lack of memory or threads; the host goes on without telemetry.
-template <class Result, class Call>
-Result guarded(Result fallback, Call&& call) noexcept {
-  try {
-    return call();
-  } catch (...) {
-    return fallback;
-  }
-}
-
-template <class Call>
-void guarded(Call&& call) noexcept {
-  try {
-    call();
-  } catch (...) {
-  }
-}
 
 struct FreePlist {
   void operator()(void* node) const noexcept { plist_free(node); }
