@@ -171,24 +171,27 @@ bool DashboardBackend::connect(const Server& server) {
 
 bool DashboardBackend::startTimer() {
   Platform& platform = _context.platform();
-  try {
-    _timer = RepeatingTimer::start(
-        platform.dispatch, platform.clock, _networkProcQueue, _period, _period, kTimerLeeway,
-        [weakSelf = weak()] {
-          const auto self = weakSelf.lock();
-          if (self == nullptr) return;
-          self->_networkProcQueue->assertOnQueue();
-          self->myPeriodicTask();
-        },
-        [weakSelf = weak()] {
-          const auto self = weakSelf.lock();
-          if (self == nullptr) return;
-          self->_networkProcQueue->assertOnQueue();
-          if (!self->_reliableUDP) self->_socket.reset();
-        });
-  } catch (const std::exception&) {
-    // No thread or memory left for it.
-  }
+  RepeatingTimer::Handlers handlers;
+  handlers.onFire = [weakSelf = weak()] {
+    const auto self = weakSelf.lock();
+    if (self == nullptr) return;
+    self->_networkProcQueue->assertOnQueue();
+    self->myPeriodicTask();
+  };
+  handlers.onCancel = [weakSelf = weak()] {
+    const auto self = weakSelf.lock();
+    if (self == nullptr) return;
+    self->_networkProcQueue->assertOnQueue();
+    if (!self->_reliableUDP) self->_socket.reset();
+  };
+  // Events go on to be sent, each once; a cleanup does not need the timer.
+  handlers.onLost = [weakSelf = weak()] {
+    if (const auto self = weakSelf.lock()) {
+      self->log().error("DashboardBackend(myPeriodicTask): no timer for the next tick. Nothing is sent again any more");
+    }
+  };
+  _timer = RepeatingTimer::start(platform.dispatch, platform.clock, _networkProcQueue,
+                                 {.delay = _period, .interval = _period, .leeway = kTimerLeeway}, std::move(handlers));
   if (_timer != nullptr) return true;
   log().error("DashboardBackend(initWithName): can't create timer source.");
   return false;

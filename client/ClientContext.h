@@ -7,6 +7,7 @@
 #include "client/ClientPlatform.h"
 #include "client/ModuleBlocks.h"
 #include "client/PendingWork.h"
+#include "client/SessionQueues.h"
 
 namespace telvane {
 
@@ -20,6 +21,9 @@ class ClientContext {
   Log& log() const noexcept { return _platform.log; }
   PendingWork& pendingWork() noexcept { return _pendingWork; }
   ModuleBlocks& moduleBlocks() noexcept { return _moduleBlocks; }
+  SessionQueues& sessionQueues() noexcept { return _sessionQueues; }
+  // Whether a session's step may be waiting for the caller, who must not wait for one then.
+  bool maySessionsWaitForCaller() const { return _sessionQueues.isInside() || _moduleBlocks.isInside(); }
 
   // Calls code of the host: not any more once the process ends, since what that code uses may be gone by then. What it
   // throws goes no further than the log. operation: the name of the operation that calls out.
@@ -43,6 +47,7 @@ class ClientContext {
   const ClientPlatform _platform;
   PendingWork _pendingWork;
   ModuleBlocks _moduleBlocks;
+  SessionQueues _sessionQueues;
   std::atomic<bool> _isEnding = false;
 };
 

@@ -112,6 +112,7 @@ std::shared_ptr<ClientSession> ClientSession::initWithSessionInfo(ClientContext&
     isLetGo->store(true, std::memory_order_release);
     return nullptr;
   }
+  context.sessionQueues().add(queue);
   return std::make_shared<ClientSession>(context, std::move(connection), std::move(queue), std::move(isLetGo));
 }
 

@@ -16,8 +16,7 @@ bool ClientSession::registerPeriodicTaskForModule(uint32_t module, bool needToUp
 }
 
 bool ClientSession::unregisterPeriodTaskForModule(uint32_t module) {
-  // There the reporting queue may be waiting for the caller.
-  if (_reportingQueue->isCurrent() || _context.moduleBlocks().isInside()) {
+  if (_context.maySessionsWaitForCaller()) {
     _reportingQueue->async([self = shared_from_this(), module] {
       const PeriodicTasks::Module removed = self->_periodicTasks.unregisterPeriodTaskForModule(module);
     });

@@ -51,16 +51,23 @@ void PeriodicTasks::startLogTimerWithInterval(std::weak_ptr<PeriodicTasks> self,
                                               uint32_t reportingMultiplier, uint16_t category, uint16_t type) {
   if (_timer != nullptr) return;
   auto logTimer = std::make_shared<LogTimer>(category, type, reportingMultiplier, interval);
-  auto fire = [self = std::move(self), reporting = _queues.reporting, logTimer] {
+  auto fire = [self, reporting = _queues.reporting, logTimer] {
     if (logTimer->isTickWaiting.exchange(true)) return;
     reporting->async([self, logTimer] {
       logTimer->isTickWaiting = false;
       if (const std::shared_ptr<PeriodicTasks> tasks = self.lock()) tasks->timerFired(logTimer);
     });
   };
+  // Behind the tick that waits, if one does.
+  auto lost = [self = std::move(self), reporting = _queues.reporting, logTimer] {
+    reporting->async([self, logTimer] {
+      if (const std::shared_ptr<PeriodicTasks> tasks = self.lock()) tasks->timerLost(logTimer);
+    });
+  };
   const ClientPlatform& platform = _context.platform();
-  _timer = RepeatingTimer::start(platform.dispatch, platform.clock, _queues.timer, std::chrono::nanoseconds::zero(),
-                                 std::chrono::seconds(interval), kLeeway, std::move(fire), {});
+  _timer = RepeatingTimer::start(platform.dispatch, platform.clock, _queues.timer,
+                                 {.interval = std::chrono::seconds(interval), .leeway = kLeeway},
+                                 {.onFire = std::move(fire), .onLost = std::move(lost)});
   if (_timer == nullptr) return;
   _logTimer = std::move(logTimer);
   _counter = 0;
@@ -74,14 +81,11 @@ void PeriodicTasks::stopLogTimer() {
     return;
   }
   log().message("stopLogTimer.");
-  _timer.reset();
-  _logTimer.reset();
-  _counter = 0;
+  forgetTimer();
 }
 
 void PeriodicTasks::end() {
-  _timer.reset();
-  _logTimer.reset();
+  forgetTimer();
   // Taken out first: code of the host may go with them and come back here.
   const auto modules = std::exchange(_periodicServiceDict, {});
 }
@@ -90,6 +94,18 @@ void PeriodicTasks::end() {
 void PeriodicTasks::timerFired(const std::shared_ptr<LogTimer>& timer) {
   if (timer != _logTimer) return;
   myPeriodicTask(timer->category, timer->type, timer->intervalMultiplier, timer->updateTimeout);
+}
+
+void PeriodicTasks::timerLost(const std::shared_ptr<LogTimer>& timer) {
+  if (timer != _logTimer) return;
+  log().error("_myPeriodicTask: No timer for the next tick. The log timer is stopped");
+  forgetTimer();
+}
+
+void PeriodicTasks::forgetTimer() {
+  _timer.reset();
+  _logTimer.reset();
+  _counter = 0;
 }
 
 std::chrono::nanoseconds PeriodicTasks::waitLimit(uint64_t updateTimeout) {

@@ -66,6 +66,9 @@ class PeriodicTasks {
 
   Log& log() const noexcept { return _context.log(); }
   void timerFired(const std::shared_ptr<LogTimer>& timer);
+  // Says so, and counts the timer as stopped, so that the client may start one again.
+  void timerLost(const std::shared_ptr<LogTimer>& timer);
+  void forgetTimer();
   void update(PeriodicTick& tick);
   bool scheduleUpdates(PeriodicTick& tick);
   void collectReports(PeriodicTick& tick);

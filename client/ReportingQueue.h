@@ -42,7 +42,8 @@ class ReportingQueue : public std::enable_shared_from_this<ReportingQueue> {
     if (!tryPerform(step)) async(std::move(step));
   }
   // Runs the step before it returns, behind everything given before, and waits for that if it must.
-  // REQUIRES: as for tryPerform; !isCurrent().
+  // REQUIRES: as for tryPerform; the caller is not in a step that waited, neither here nor where such a wait leads back
+  // to here.
   template <class Step>
   void sync(Dispatch& dispatch, Step& step) {
     if (tryPerform(step)) return;
@@ -53,8 +54,6 @@ class ReportingQueue : public std::enable_shared_from_this<ReportingQueue> {
     });
     isDone->wait();
   }
-  // Whether the caller runs in a step that waited, and could not wait for another one.
-  bool isCurrent() const noexcept { return _queue->isCurrent(); }
   // Runs the step on the serial queue, behind everything given before.
   void async(Job step);
   // The same for a step that holds a message of about this many bytes. Drops it beyond the bound.

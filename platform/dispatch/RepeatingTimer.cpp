@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cstdint>
+#include <exception>
 #include <utility>
 
 #include "platform/Mutex.h"
@@ -20,15 +21,15 @@ Clock::MonotonicTime later(Clock::MonotonicTime time, std::chrono::nanoseconds b
 
 // Shared with the firing that is on its way, so that it outlives the timer.
 struct RepeatingTimer::State : std::enable_shared_from_this<RepeatingTimer::State> {
-  State(Dispatch& dispatch_, const Clock& clock_, std::shared_ptr<SerialQueue> queue_,
-        std::chrono::nanoseconds interval_, std::chrono::nanoseconds leeway_, Handler fire, Job cancelled)
+  State(Dispatch& dispatch_, const Clock& clock_, std::shared_ptr<SerialQueue> queue_, const Times& times,
+        Handlers handlers_)
       : dispatch(dispatch_),
         clock(clock_),
         queue(std::move(queue_)),
-        interval(std::max(interval_, kShortestInterval)),
-        leeway(leeway_),
-        onFire(std::move(fire)),
-        onCancel(std::move(cancelled)) {}
+        interval(std::max(times.interval, kShortestInterval)),
+        leeway(times.leeway),
+        due(later(clock_.monotonicNow(), times.delay)),
+        handlers(std::move(handlers_)) {}
 
   // Sets the single timer of the next firing. Returns false when there is none to be had.
   bool schedule(std::chrono::nanoseconds delay) EXCLUDES(mutex) {
@@ -37,12 +38,19 @@ struct RepeatingTimer::State : std::enable_shared_from_this<RepeatingTimer::Stat
       MutexLock lock(mutex);
       number = ++scheduleCount;
     }
-    auto next = dispatch.newTimer(queue, delay, leeway, [state = shared_from_this()] { state->fire(); }, {});
+    auto next = newTimer(delay);
     if (next == nullptr) return false;
     MutexLock lock(mutex);
     // The first one may have fired already, and the next be set: that one must stay. What is not kept goes here.
     if (!isCancelled && number == scheduleCount) timer.swap(next);
     return true;
+  }
+  std::unique_ptr<Timer> newTimer(std::chrono::nanoseconds delay) {
+    try {
+      return dispatch.newTimer(queue, delay, leeway, [state = shared_from_this()] { state->fire(); }, {});
+    } catch (const std::exception&) {
+      return nullptr;  // no thread or memory left for it
+    }
   }
   // On the queue.
   void fire() EXCLUDES(mutex) {
@@ -51,14 +59,15 @@ struct RepeatingTimer::State : std::enable_shared_from_this<RepeatingTimer::Stat
       if (isCancelled) return;
     }
     // Taken out while it runs, so that a handler that cancels does not destroy itself.
-    Handler handler = std::move(onFire);
+    UniqueFunction<void()> handler = std::move(handlers.onFire);
     handler();
     {
       MutexLock lock(mutex);
       if (isCancelled) return;
     }
-    onFire = std::move(handler);
-    schedule(timeToNext());
+    handlers.onFire = std::move(handler);
+    if (schedule(timeToNext())) return;
+    if (handlers.onLost) std::exchange(handlers.onLost, nullptr)();
   }
   std::chrono::nanoseconds timeToNext() {
     const Clock::MonotonicTime now = clock.monotonicNow();
@@ -76,8 +85,9 @@ struct RepeatingTimer::State : std::enable_shared_from_this<RepeatingTimer::Stat
     }
     stopped.reset();
     queue->async([state = shared_from_this()] {
-      state->onFire = nullptr;
-      if (state->onCancel) std::exchange(state->onCancel, nullptr)();
+      state->handlers.onFire = nullptr;
+      state->handlers.onLost = nullptr;
+      if (state->handlers.onCancel) std::exchange(state->handlers.onCancel, nullptr)();
     });
   }
 
@@ -88,8 +98,7 @@ struct RepeatingTimer::State : std::enable_shared_from_this<RepeatingTimer::Stat
   const std::chrono::nanoseconds leeway;
   // Confined to the queue.
   Clock::MonotonicTime due;
-  Handler onFire;
-  Job onCancel;
+  Handlers handlers;
 
   Mutex mutex;
   bool isCancelled GUARDED_BY(mutex) = false;
@@ -98,13 +107,10 @@ struct RepeatingTimer::State : std::enable_shared_from_this<RepeatingTimer::Stat
 };
 
 std::unique_ptr<RepeatingTimer> RepeatingTimer::start(Dispatch& dispatch, const Clock& clock,
-                                                      std::shared_ptr<SerialQueue> queue,
-                                                      std::chrono::nanoseconds delay, std::chrono::nanoseconds interval,
-                                                      std::chrono::nanoseconds leeway, Handler onFire, Job onCancel) {
-  auto state = std::make_shared<State>(dispatch, clock, std::move(queue), interval, leeway, std::move(onFire),
-                                       std::move(onCancel));
-  state->due = later(clock.monotonicNow(), delay);
-  if (!state->schedule(delay)) return nullptr;
+                                                      std::shared_ptr<SerialQueue> queue, const Times& times,
+                                                      Handlers handlers) {
+  auto state = std::make_shared<State>(dispatch, clock, std::move(queue), times, std::move(handlers));
+  if (!state->schedule(times.delay)) return nullptr;
   return std::unique_ptr<RepeatingTimer>(new RepeatingTimer(std::move(state)));
 }
 

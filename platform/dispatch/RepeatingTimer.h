@@ -14,17 +14,27 @@ namespace telvane {
 // who started it, who cancels it or lets it go, which cancels too. Safe from any thread.
 class RepeatingTimer {
  public:
-  using Handler = UniqueFunction<void()>;
+  struct Times {
+    std::chrono::nanoseconds delay{0};     // to the first firing
+    std::chrono::nanoseconds interval{0};  // from one to the next; less than a millisecond counts as one
+    std::chrono::nanoseconds leeway{0};    // how much later each may come
+  };
+  // What is called, all of it on the queue. All but onFire may be empty.
+  struct Handlers {
+    // At each firing, never twice at once.
+    UniqueFunction<void()> onFire{};
+    // Once when the timer has been cancelled; onFire is not called any more behind it, nor after a cancel on the queue.
+    Job onCancel{};
+    // Once, behind onFire, when the dispatch has no timer for the next firing: there is none any more then. The timer
+    // is cancelled as always.
+    Job onLost{};
+  };
 
-  // Starts a timer that fires first after the delay and then every interval, each time up to leeway later.
-  // onFire is called on the queue, never twice at once. onCancel, which may be empty, runs once on the queue when the
-  // timer has been cancelled; onFire is not called any more behind it, nor after a cancel on the queue. An interval of
-  // less than a millisecond counts as one. Returns null when the dispatch has no timer to give.
+  // Starts a timer. Returns null when the dispatch has none to give; nothing is called then.
   // REQUIRES: dispatch and clock outlive the timer and the queue's jobs.
   static std::unique_ptr<RepeatingTimer> start(Dispatch& dispatch, const Clock& clock,
-                                               std::shared_ptr<SerialQueue> queue, std::chrono::nanoseconds delay,
-                                               std::chrono::nanoseconds interval, std::chrono::nanoseconds leeway,
-                                               Handler onFire, Job onCancel);
+                                               std::shared_ptr<SerialQueue> queue, const Times& times,
+                                               Handlers handlers);
   ~RepeatingTimer();
   RepeatingTimer(const RepeatingTimer&) = delete;
   RepeatingTimer& operator=(const RepeatingTimer&) = delete;

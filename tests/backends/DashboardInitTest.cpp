@@ -1,9 +1,12 @@
 // How a dashboard backend comes to be, or does not.
+#include <gmock/gmock.h>
+
 #include <cerrno>
 #include <cmath>
 #include <system_error>
 
 #include "tests/backends/DashboardFixture.h"
+#include "tests/support/PlatformWith.h"
 
 namespace telvane::testing {
 namespace {
@@ -198,18 +201,23 @@ TEST_F(DashboardInitTest, staysReliableWithoutAReader) {
   EXPECT_EQ(network().openSockets(), 0u);
 }
 
-// Has no timers, and says so in one of two ways.
+// Has so many timers and then none any more, and says so in one of two ways.
 class TimerlessDispatch final : public Dispatch {
  public:
-  TimerlessDispatch(Dispatch& dispatch, bool throws) : _dispatch(dispatch), _throws(throws) {}
+  TimerlessDispatch(Dispatch& dispatch, bool throws, int timers = 0)
+      : _dispatch(dispatch), _throws(throws), _timers(timers) {}
   std::shared_ptr<SerialQueue> newSerialQueue(std::string label, QualityOfService qos) override {
     return _dispatch.newSerialQueue(std::move(label), qos);
   }
   std::shared_ptr<ConcurrentQueue> newConcurrentQueue(std::string label, QualityOfService qos) override {
     return _dispatch.newConcurrentQueue(std::move(label), qos);
   }
-  std::unique_ptr<Timer> newTimer(std::shared_ptr<SerialQueue>, std::chrono::nanoseconds, std::chrono::nanoseconds, Job,
-                                  Job) override {
+  std::unique_ptr<Timer> newTimer(std::shared_ptr<SerialQueue> queue, std::chrono::nanoseconds delay,
+                                  std::chrono::nanoseconds leeway, Job onFire, Job onCancel) override {
+    if (_timers > 0) {
+      --_timers;
+      return _dispatch.newTimer(std::move(queue), delay, leeway, std::move(onFire), std::move(onCancel));
+    }
     if (_throws) throw std::system_error(EAGAIN, std::generic_category());
     return nullptr;
   }
@@ -219,6 +227,7 @@ class TimerlessDispatch final : public Dispatch {
  private:
   Dispatch& _dispatch;
   const bool _throws;
+  int _timers;
 };
 
 class DashboardWithoutATimerTest : public DashboardInitTest, public ::testing::WithParamInterface<bool> {};
@@ -226,25 +235,7 @@ class DashboardWithoutATimerTest : public DashboardInitTest, public ::testing::W
 TEST_P(DashboardWithoutATimerTest, isNotMade) {
   const Platform& usual = _process.platform();
   TimerlessDispatch timerless(usual.dispatch, GetParam());
-  Platform platform{usual.clock,
-                    usual.random,
-                    timerless,
-                    usual.log,
-                    usual.files,
-                    usual.userDefaults,
-                    usual.deviceAnswers,
-                    usual.locale,
-                    usual.consent,
-                    usual.clientBundle,
-                    usual.urlSessions,
-                    usual.transactions,
-                    usual.localService,
-                    usual.submittableLogs,
-                    usual.processMemory,
-                    usual.datagramSockets,
-                    usual.sandboxExtensions,
-                    usual.wirelessDiagnostics,
-                    usual.powerLog};
+  Platform platform = platformWith(usual, timerless);
   const ProcessContext withoutTimers(platform);
   const char* line = "DashboardBackend(initWithName): can't create timer source.";
   log().expectError(line);
@@ -253,6 +244,27 @@ TEST_P(DashboardWithoutATimerTest, isNotMade) {
   EXPECT_EQ(DashboardBackend::initWithName(withoutTimers, "dashboard", _profile, String("Box")), nullptr);
   _world.runUntilIdle();
   EXPECT_TRUE(hasLines(log(), 2, line));
+  EXPECT_EQ(network().openSockets(), 0u);
+}
+
+TEST_P(DashboardWithoutATimerTest, saysOnceThatItHasNoneAnyMoreAndStillSendsEachEventOnce) {
+  // For three ticks.
+  TimerlessDispatch timerless(_process.platform().dispatch, GetParam(), 3);
+  Platform platform = platformWith(_process.platform(), timerless);
+  const ProcessContext fading(platform);
+  const char* line = "DashboardBackend(myPeriodicTask): no timer for the next tick. Nothing is sent again any more";
+  log().expectError(line);
+  givenReliable();
+  take(DashboardBackend::initWithName(fading, "dashboard", _profile, String("Box")));
+  send({});
+  tick(30);
+  EXPECT_THAT(arrivalPeriods(), ::testing::ElementsAre(0, 2));
+  EXPECT_TRUE(hasLines(log(), 1, line));
+  send({});
+  tick(30);
+  EXPECT_THAT(arrivalPeriods(), ::testing::ElementsAre(0, 2, 30));
+  cleanupAndLetGo();
+  _world.advance(std::chrono::seconds(10));
   EXPECT_EQ(network().openSockets(), 0u);
 }
 

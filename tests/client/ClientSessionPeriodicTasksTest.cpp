@@ -237,6 +237,33 @@ TEST_F(ClientSessionPeriodicTasksTest, doesNothingWithoutATimerToBeHad) {
   run();
 }
 
+TEST_F(ClientSessionPeriodicTasksTest, saysThatItsTimerIsLostAndStartsAnotherOne) {
+  NoTimers fading(client().platform().dispatch);
+  fading.refuses = false;
+  const Platform& platform = client().platform();
+  ClientContext context{ClientPlatform(platform.clock, fading, platform.log, platform.random, platform.userDefaults,
+                                       platform.localService)};
+  const char* line = "_myPeriodicTask: No timer for the next tick. The log timer is stopped";
+  log().expectError(line);
+  std::shared_ptr<Telvane> session = TelvaneFactory::initWithSessionInfo(context, sessionInfo());
+  EXPECT_TRUE(session->registerPeriodicTaskForModule(7, true, true, noting(_calls)));
+  session->startLogTimerWithInterval(1, 1, 5, 6);
+  _world.advance(1500ms);
+  fading.refuses = true;
+  _world.advance(10s);
+  EXPECT_THAT(_calls, ElementsAre(0, 1000, 2000)) << "the last one had its timer already";
+  EXPECT_TRUE(hasLines(log(), 1, line));
+  fading.refuses = false;
+  session->startLogTimerWithInterval(1, 1, 5, 6);
+  _world.advance(1s);
+  EXPECT_THAT(_calls, ElementsAre(0, 1000, 2000, 11500, 12500));
+  session->stopLogTimer();
+  run();
+  EXPECT_TRUE(hasLines(log(), 1, "stopLogTimer."));
+  session.reset();
+  run();
+}
+
 TEST_F(ClientSessionPeriodicTasksTest, filtersTheEventLikeAnyOther) {
   _session = openConfigured({}, Array{7});
   addModule(7, reporting(1));
@@ -432,6 +459,69 @@ TEST_F(ClientSessionPeriodicTasksTest, theDelegateMayUnregister) {
   _world.advance(5s);
   EXPECT_EQ(delegate->count, 1) << "it is told of the event";
   EXPECT_EQ(_calls.size(), 1u);
+}
+
+// Told of one session's messages while it takes a module away from another one.
+class DelegateOfOneForTheOther final : public TelvaneMessageSentDelegate {
+ public:
+  DelegateOfOneForTheOther(std::shared_ptr<Telvane> other, std::function<void()> beforehand)
+      : _other(std::move(other)), _beforehand(std::move(beforehand)) {}
+  void didSendMessageForReportingClient(const std::shared_ptr<Telvane>&, const Dictionary&) override {
+    _beforehand();
+    EXPECT_TRUE(_other->unregisterPeriodTaskForModule(7));
+    ++count;
+  }
+  int count = 0;
+
+ private:
+  const std::shared_ptr<Telvane> _other;
+  const std::function<void()> _beforehand;
+};
+
+// Each would wait for the step that calls the other.
+TEST_F(ClientSessionPeriodicTasksTest, delegatesOfTwoSessionsMayUnregisterEachOthersModules) {
+  const std::shared_ptr<Telvane> other = open();
+  const auto first = std::make_shared<DelegateOfOneForTheOther>(other, [this] { sleep(100ms); });
+  const auto second = std::make_shared<DelegateOfOneForTheOther>(_session, [this] { sleep(100ms); });
+  _session->setMessageSentDelegate(first);
+  other->setMessageSentDelegate(second);
+  for (Telvane* session : {_session.get(), other.get()}) {
+    EXPECT_TRUE(session->registerPeriodicTaskForModule(7, true, true, noting(_calls)));
+    EXPECT_TRUE(session->sendMessageWithCategory(5, 6));
+  }
+  _world.advance(1s);
+  EXPECT_EQ(first->count, 1);
+  EXPECT_EQ(second->count, 1);
+  EXPECT_TRUE(hasLines(log(), 2, "unregisterPeriodTaskForModule: 7 removed"));
+  startTimer();
+  other->startLogTimerWithInterval(1, 1, 5, 6);
+  _world.advance(1s);
+  EXPECT_TRUE(_calls.empty());
+  other->stopLogTimer();
+  other->setMessageSentDelegate({});
+  _session->setMessageSentDelegate({});
+  run();
+}
+
+// Elsewhere, the wait is kept: behind it the module's block does not run, whatever other sessions do.
+TEST_F(ClientSessionPeriodicTasksTest, removingWaitsAlsoWhileADelegateOfAnotherSessionIsTold) {
+  const std::shared_ptr<Telvane> other = open();
+  const auto delegate = std::make_shared<DelegateOfOneForTheOther>(_session, [this] { sleep(2s); });
+  other->setMessageSentDelegate(delegate);
+  EXPECT_TRUE(other->sendMessageWithCategory(5, 6));
+  addModule(8, [&](Dictionary*) { sleep(500ms); });
+  startTimer(10);
+  int64_t removedAt = -1;
+  client().spawn("other", [&] {
+    sleep(100ms);
+    EXPECT_TRUE(_session->unregisterPeriodTaskForModule(8));
+    removedAt = elapsed();
+  });
+  _world.advance(5s);
+  EXPECT_EQ(removedAt, 500);
+  EXPECT_EQ(delegate->count, 1);
+  other->setMessageSentDelegate({});
+  run();
 }
 
 // What a block holds goes with it, and may call the session from there.

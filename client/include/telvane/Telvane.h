@@ -163,8 +163,8 @@ class TELVANE_EXPORT Telvane : public std::enable_shared_from_this<Telvane> {
                                      PeriodicTaskBlock serviceBlock);
   // Takes a module away, behind what was called before, and waits until that is done, if need be for the end of a tick.
   // Then its block does not run and is not called any more (with an interval of 0, one that was called may still run).
-  // Called inside a module's block, of whichever session, or inside the delegate, for which the wait could be one for
-  // itself, it returns at once, and the module goes when what was called before is done: when the tick is over.
+  // Called inside a module's block or a delegate, of whichever session, for which the wait could be one for itself, it
+  // returns at once, and the module goes when what was called before is done: when the tick is over.
   // Returns true, whether there was such a module or not.
   bool unregisterPeriodTaskForModule(uint32_t module);
   // Starts the log timer, which ticks at once and then every interval, in seconds (0 is a millisecond, and of no use

@@ -4,7 +4,9 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
+#include <cerrno>
 #include <functional>
+#include <system_error>
 #include <vector>
 
 #include "platform/dispatch/SystemClock.h"
@@ -25,6 +27,7 @@ class OtherTimers final : public Dispatch {
   // Before a new timer is handed over.
   std::function<void()> onNewTimer;
   bool refuses = false;
+  bool throws = false;  // when it refuses
 
   std::shared_ptr<SerialQueue> newSerialQueue(std::string label, QualityOfService qos) override {
     return _other.newSerialQueue(std::move(label), qos);
@@ -34,6 +37,7 @@ class OtherTimers final : public Dispatch {
   }
   std::unique_ptr<Timer> newTimer(std::shared_ptr<SerialQueue> queue, std::chrono::nanoseconds delay,
                                   std::chrono::nanoseconds leeway, Job onFire, Job onCancel) override {
+    if (refuses && throws) throw std::system_error(EAGAIN, std::generic_category());
     if (refuses) return nullptr;
     auto timer = _other.newTimer(std::move(queue), delay, leeway, std::move(onFire), std::move(onCancel));
     if (onNewTimer) std::exchange(onNewTimer, nullptr)();
@@ -54,18 +58,24 @@ class RepeatingTimerTest : public ::testing::Test {
   // says.
   std::unique_ptr<RepeatingTimer> start(std::chrono::nanoseconds delay, std::chrono::nanoseconds interval,
                                         std::chrono::nanoseconds leeway = 0ns) {
-    return RepeatingTimer::start(
-        _dispatch, _world.clock(), _queue, delay, interval, leeway,
-        [this] {
-          EXPECT_TRUE(_queue->isCurrent());
-          EXPECT_EQ(_cancellations.size(), 0u) << "it fires behind its cancel handler";
-          _firings.push_back(elapsed());
-          if (_onFire) _onFire();
-        },
-        [this] {
-          EXPECT_TRUE(_queue->isCurrent());
-          _cancellations.push_back(elapsed());
-        });
+    RepeatingTimer::Handlers handlers;
+    handlers.onFire = [this] {
+      EXPECT_TRUE(_queue->isCurrent());
+      EXPECT_EQ(_cancellations.size(), 0u) << "it fires behind its cancel handler";
+      _firings.push_back(elapsed());
+      if (_onFire) _onFire();
+    };
+    handlers.onCancel = [this] {
+      EXPECT_TRUE(_queue->isCurrent());
+      _cancellations.push_back(elapsed());
+    };
+    handlers.onLost = [this] {
+      EXPECT_TRUE(_queue->isCurrent());
+      _losses.push_back(elapsed());
+      if (_onLost) _onLost();
+    };
+    return RepeatingTimer::start(_dispatch, _world.clock(), _queue,
+                                 {.delay = delay, .interval = interval, .leeway = leeway}, std::move(handlers));
   }
   int64_t elapsed() {
     return std::chrono::duration_cast<std::chrono::milliseconds>(_world.scheduler().now() - SimulatedScheduler::kStart)
@@ -86,7 +96,9 @@ class RepeatingTimerTest : public ::testing::Test {
   std::shared_ptr<SerialQueue> _queue = _process.dispatch().newSerialQueue("timers");
   std::vector<int64_t> _firings;
   std::vector<int64_t> _cancellations;
+  std::vector<int64_t> _losses;
   std::function<void()> _onFire;
+  std::function<void()> _onLost;
 };
 
 TEST_F(RepeatingTimerTest, firesAfterTheDelayAndThenEveryInterval) {
@@ -207,8 +219,8 @@ TEST_F(RepeatingTimerTest, mayBeCancelledElsewhereWhileItsHandlerRuns) {
 TEST_F(RepeatingTimerTest, letsGoOfItsHandlersWhenItIsCancelled) {
   auto held = std::make_shared<int>(0);
   const std::weak_ptr<int> observer = held;
-  const auto timer = RepeatingTimer::start(
-      _dispatch, _world.clock(), _queue, 0s, 1s, 0s, [held] {}, [held] {});
+  const auto timer = RepeatingTimer::start(_dispatch, _world.clock(), _queue, {.interval = 1s},
+                                           {.onFire = [held] {}, .onCancel = [held] {}, .onLost = [held] {}});
   held.reset();
   _world.advance(2s);
   EXPECT_FALSE(observer.expired());
@@ -219,7 +231,8 @@ TEST_F(RepeatingTimerTest, letsGoOfItsHandlersWhenItIsCancelled) {
 
 TEST_F(RepeatingTimerTest, needsNoCancelHandler) {
   int firings = 0;
-  auto timer = RepeatingTimer::start(_dispatch, _world.clock(), _queue, 0s, 1s, 0s, [&] { ++firings; }, {});
+  auto timer =
+      RepeatingTimer::start(_dispatch, _world.clock(), _queue, {.interval = 1s}, {.onFire = [&] { ++firings; }});
   _world.advance(1s);
   timer.reset();
   _world.advance(5s);
@@ -239,12 +252,59 @@ TEST_F(RepeatingTimerTest, bearsTimesThatNeverCome) {
   EXPECT_THAT(_firings, ElementsAre(1000));
 }
 
-TEST_F(RepeatingTimerTest, isNotMadeWithoutATimer) {
+// There is no timer to be had, which the dispatch says in one of two ways.
+class RepeatingTimerRefusedTest : public RepeatingTimerTest, public ::testing::WithParamInterface<bool> {
+ protected:
+  RepeatingTimerRefusedTest() { _dispatch.throws = GetParam(); }
+};
+
+TEST_P(RepeatingTimerRefusedTest, isNotMade) {
   _dispatch.refuses = true;
   EXPECT_EQ(start(0s, 1s), nullptr);
   _world.advance(2s);
   EXPECT_TRUE(_firings.empty());
+  EXPECT_TRUE(_losses.empty()) << "who starts it is told by what is returned";
+  EXPECT_TRUE(_cancellations.empty());
 }
+
+TEST_P(RepeatingTimerRefusedTest, saysOnceThatItsNextFiringIsLost) {
+  const auto timer = start(0s, 1s);
+  _onFire = [this] { _dispatch.refuses = _firings.size() == 3; };
+  _world.advance(10s);
+  EXPECT_THAT(_firings, ElementsAre(0, 1000, 2000));
+  EXPECT_THAT(_losses, ElementsAre(2000));
+  _dispatch.refuses = false;
+  _world.advance(10s);
+  EXPECT_EQ(_firings.size(), 3u) << "nobody starts it again by himself";
+  timer->cancel();
+  _world.advance(10s);
+  EXPECT_THAT(_cancellations, ElementsAre(20000));
+  EXPECT_EQ(_losses.size(), 1u);
+}
+
+TEST_P(RepeatingTimerRefusedTest, mayBeLetGoWhenItIsLost) {
+  auto timer = start(0s, 1s);
+  _onFire = [this] { _dispatch.refuses = true; };
+  _onLost = [&timer] { timer.reset(); };
+  _world.advance(5s);
+  EXPECT_EQ(timer, nullptr);
+  EXPECT_THAT(_losses, ElementsAre(0));
+  EXPECT_THAT(_cancellations, ElementsAre(0));
+}
+
+TEST_P(RepeatingTimerRefusedTest, isNotLostWhenItsHandlerCancels) {
+  auto timer = start(0s, 1s);
+  _onFire = [&] {
+    _dispatch.refuses = true;
+    timer->cancel();
+  };
+  _world.advance(5s);
+  EXPECT_TRUE(_losses.empty());
+  EXPECT_THAT(_cancellations, ElementsAre(0));
+}
+
+INSTANTIATE_TEST_SUITE_P(Ways, RepeatingTimerRefusedTest, ::testing::Bool(),
+                         [](const auto& way) { return way.param ? "thrown" : "null"; });
 
 // Who starts the timer may be slower than its first firing, which then has set the second one already.
 TEST_F(RepeatingTimerTest, goesOnWhenItsFirstFiringOvertakesItsStart) {
@@ -271,9 +331,9 @@ TEST_F(RepeatingTimerThreadsTest, firesOnItsQueueUntilItIsCancelled) {
   std::atomic<int> firings = 0;
   std::atomic<int> cancellations = 0;
   const auto begin = _clock.monotonicNow();
-  const auto timer = RepeatingTimer::start(
-      _dispatch, _clock, _queue, 1ms, 2ms, 0ns, [&] { firings += _queue->isCurrent() ? 1 : 1000; },
-      [&] { cancellations += _queue->isCurrent() ? 1 : 1000; });
+  const auto timer = RepeatingTimer::start(_dispatch, _clock, _queue, {.delay = 1ms, .interval = 2ms},
+                                           {.onFire = [&] { firings += _queue->isCurrent() ? 1 : 1000; },
+                                            .onCancel = [&] { cancellations += _queue->isCurrent() ? 1 : 1000; }});
   ASSERT_TRUE(eventually([&] { return firings >= 10; }));
   EXPECT_GE(_clock.monotonicNow() - begin, 1ms + 9 * 2ms);
   timer->cancel();
@@ -291,7 +351,8 @@ TEST_F(RepeatingTimerThreadsTest, goesOnHoweverFastItsFirstFiringIs) {
   std::vector<std::atomic<int>> firings(kTimers);
   std::vector<std::unique_ptr<RepeatingTimer>> timers;
   for (std::atomic<int>& count : firings) {
-    timers.push_back(RepeatingTimer::start(_dispatch, _clock, _queue, 0ns, 1ms, 0ns, [&count] { ++count; }, {}));
+    timers.push_back(
+        RepeatingTimer::start(_dispatch, _clock, _queue, {.interval = 1ms}, {.onFire = [&count] { ++count; }}));
   }
   for (std::atomic<int>& count : firings) EXPECT_TRUE(eventually([&] { return count >= 3; }));
   timers.clear();
@@ -303,7 +364,8 @@ TEST_F(RepeatingTimerThreadsTest, isCancelledAtAnyMoment) {
     std::atomic<int> cancellations = 0;
     int firingsBehind = 0;
     auto timer = RepeatingTimer::start(
-        _dispatch, _clock, _queue, 0ns, 1ms, 0ns, [&] { firingsBehind += cancellations; }, [&] { ++cancellations; });
+        _dispatch, _clock, _queue, {.interval = 1ms},
+        {.onFire = [&] { firingsBehind += cancellations; }, .onCancel = [&] { ++cancellations; }});
     // Now, after a hand-over to the queue, or after some firings.
     if (round % 3 == 1) {
       ASSERT_TRUE(drain(_dispatch, *_queue));
