@@ -3,46 +3,18 @@
 #include <gmock/gmock.h>
 #include <openssl/hmac.h>
 
-#include <fstream>
-#include <iterator>
 #include <set>
 
 #include "backends/MessageFlags.h"
 #include "interfaces/EventKeys.h"
 #include "interfaces/StorebagKeys.h"
 #include "tests/backends/BackendFixture.h"
+#include "tests/backends/ProtocolPage.h"
 
 namespace telvane::testing {
 namespace {
 
 constexpr char kDigestKey[] = "secret";
-
-std::string document() {
-  std::ifstream file(TELVANE_SOURCE_DIR "/docs/collector-protocol.md");
-  return {std::istreambuf_iterator<char>(file), std::istreambuf_iterator<char>()};
-}
-
-// What stands between the two texts, the first time that both do; empty when they do not.
-std::string between(const std::string& text, const std::string& start, const std::string& end) {
-  const size_t from = text.find(start);
-  if (from == std::string::npos) return "";
-  const size_t begin = from + start.size();
-  return text.substr(begin, text.find(end, begin) - begin);
-}
-
-std::string example(const std::string& name) {
-  return between(document(), "<!-- example: " + name + " -->\n```\n", "\n```\n");
-}
-
-// The names in the first column of the section's table.
-std::vector<std::string> namesIn(const std::string& section) {
-  std::vector<std::string> names;
-  const std::string text = between(document(), "\n## " + section + "\n", "\n## ");
-  for (size_t at = text.find("\n| `"); at != std::string::npos; at = text.find("\n| `", at + 1)) {
-    names.push_back(between(text.substr(at), "`", "`"));
-  }
-  return names;
-}
 
 std::set<std::string> keysOf(const Dictionary& dictionary) {
   std::set<std::string> keys;
@@ -62,6 +34,17 @@ class CollectorProtocolTest : public BackendFixture {
     backend().setDigestKey(Data::copyOf(kDigestKey));
     return posted({{Key("title"), "song"}});
   }
+  // The names in the first column of the section's table.
+  std::vector<std::string> namesIn(const std::string& section) const {
+    std::vector<std::string> names;
+    const std::string text = _page.section(section);
+    for (size_t at = text.find("\n| `"); at != std::string::npos; at = text.find("\n| `", at + 1)) {
+      names.push_back(between(text.substr(at), "`", "`"));
+    }
+    return names;
+  }
+
+  const ProtocolPage _page{"collector-protocol.md"};
 };
 
 TEST_F(CollectorProtocolTest, theTableOfHeadersIsWhatIsSentAndInThatOrder) {
@@ -90,19 +73,15 @@ TEST_F(CollectorProtocolTest, theTableOfAnEventNamesItsKeys) {
 TEST_F(CollectorProtocolTest, theExampleIsAPostByteForByte) {
   postEverything();
   const URLRequest request = posts().lastRequest();
-  EXPECT_EQ(example("json"), RecordingConnectivity::bodyText(request));
-  std::string headers;
-  for (const URLRequest::Header& header : request.headers) {
-    headers += (headers.empty() ? "" : "\n") + header.name + ": " + header.value;
-  }
-  EXPECT_EQ(example("headers"), headers);
+  EXPECT_EQ(_page.example("json"), RecordingConnectivity::bodyText(request));
+  EXPECT_EQ(_page.example("headers"), headerLines(request));
 }
 
 TEST_F(CollectorProtocolTest, theExamplesDigestIsThatOfItsText) {
-  const std::string json = example("json");
+  const std::string json = _page.example("json");
   std::string hex;
   for (const char c : std::string_view(kDigestKey)) hex += fmt::format("{:02x}", c);
-  EXPECT_EQ(example("key"), hex);
+  EXPECT_EQ(_page.example("key"), hex);
   unsigned char digest[EVP_MAX_MD_SIZE];
   unsigned size = 0;
   ASSERT_NE(HMAC(EVP_sha1(), kDigestKey, sizeof kDigestKey - 1, reinterpret_cast<const unsigned char*>(json.data()),
@@ -111,7 +90,7 @@ TEST_F(CollectorProtocolTest, theExamplesDigestIsThatOfItsText) {
   std::string groups;
   for (unsigned i = 0; i < size; ++i) groups += fmt::format("{}{:02x}", i > 0 && i % 4 == 0 ? " " : "", digest[i]);
   EXPECT_EQ(size, 20u);
-  EXPECT_EQ(between(example("headers") + "\n", "X-TVN-DIGEST: <", ">\n"), groups);
+  EXPECT_EQ(between(_page.example("headers") + "\n", "X-TVN-DIGEST: <", ">\n"), groups);
 }
 
 }  // namespace

@@ -1,31 +1,14 @@
 // That docs/dashboard-protocol.md says what is sent: its examples byte for byte, its schedule period for period.
 #include <gmock/gmock.h>
 
-#include <fstream>
-#include <iterator>
 #include <sstream>
 
 #include "platform/KeyedArchive.h"
 #include "tests/backends/DashboardFixture.h"
+#include "tests/backends/ProtocolPage.h"
 
 namespace telvane::testing {
 namespace {
-
-std::string document() {
-  std::ifstream file(TELVANE_SOURCE_DIR "/docs/dashboard-protocol.md");
-  return {std::istreambuf_iterator<char>(file), std::istreambuf_iterator<char>()};
-}
-
-std::string between(const std::string& text, const std::string& start, const std::string& end) {
-  const size_t from = text.find(start);
-  if (from == std::string::npos) return "";
-  const size_t begin = from + start.size();
-  return text.substr(begin, text.find(end, begin) - begin);
-}
-
-std::string example(const std::string& name) {
-  return between(document(), "<!-- example: " + name + " -->\n```\n", "\n```\n");
-}
 
 // Sixteen bytes to a line, as the page writes them.
 std::string hexadecimal(std::span<const uint8_t> bytes) {
@@ -48,27 +31,29 @@ class DashboardProtocolTest : public DashboardFixture {
     _world.runUntilIdle();
     return line;
   }
+
+  const ProtocolPage _page{"dashboard-protocol.md"};
 };
 
 TEST_F(DashboardProtocolTest, theExampleIsADatagramByteForByte) {
   sendExample();
   ASSERT_EQ(dashboard().arrivals().size(), 1u);
-  EXPECT_EQ(example("datagram"), hexadecimal(dashboard().arrivals().front().bytes));
+  EXPECT_EQ(_page.example("datagram"), hexadecimal(dashboard().arrivals().front().bytes));
 }
 
-TEST_F(DashboardProtocolTest, theLineIsWhatTheClientGets) { EXPECT_EQ(sendExample(), String(example("line"))); }
+TEST_F(DashboardProtocolTest, theLineIsWhatTheClientGets) { EXPECT_EQ(sendExample(), String(_page.example("line"))); }
 
 TEST_F(DashboardProtocolTest, theArchiveIsThatOfItsArray) {
   const auto archive = keyedarchive::archive(Array{Dictionary{{Key("text"), "hi"}}});
   ASSERT_TRUE(archive.has_value());
-  EXPECT_EQ(example("archive"), hexadecimal({archive->bytes(), archive->size()}));
+  EXPECT_EQ(_page.example("archive"), hexadecimal({archive->bytes(), archive->size()}));
 }
 
 TEST_F(DashboardProtocolTest, theScheduleIsThatOfTheBackend) {
   sendExample();
   tick(40);
   std::vector<int64_t> periods;
-  std::istringstream rows(between(document(), "\n## The schedule\n", "\n## "));
+  std::istringstream rows(_page.section("The schedule"));
   for (std::string row; std::getline(rows, row);) {
     if (row.starts_with("| ") && row.find("sent") != std::string::npos) periods.push_back(std::stoi(row.substr(2)));
   }

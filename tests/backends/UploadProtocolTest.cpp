@@ -3,36 +3,18 @@
 #include <gmock/gmock.h>
 
 #include <cstring>
-#include <fstream>
-#include <iterator>
 
 #include "platform/Compression.h"
+#include "tests/backends/ProtocolPage.h"
 #include "tests/backends/UploadFixture.h"
 #include "tests/support/BodyBytes.h"
 
 namespace telvane::testing {
 namespace {
 
-std::string document() {
-  std::ifstream file(TELVANE_SOURCE_DIR "/docs/upload-protocol.md");
-  return {std::istreambuf_iterator<char>(file), std::istreambuf_iterator<char>()};
-}
-
-// What stands between the two texts, the first time that both do; empty when they do not.
-std::string between(const std::string& text, const std::string& start, const std::string& end) {
-  const size_t from = text.find(start);
-  if (from == std::string::npos) return "";
-  const size_t begin = from + start.size();
-  return text.substr(begin, text.find(end, begin) - begin);
-}
-
-std::string example(const std::string& name) {
-  return between(document(), "<!-- example: " + name + " -->\n```\n", "\n```\n");
-}
-
 // The rows of the table that begins with a column of this name: first and second column.
-std::vector<std::pair<std::string, std::string>> tableOf(const std::string& column) {
-  const std::string text = between(document(), "\n| " + column + " | value |\n|---|---|\n", "\n\n") + "\n";
+std::vector<std::pair<std::string, std::string>> tableOf(const ProtocolPage& page, const std::string& column) {
+  const std::string text = between(page.text(), "\n| " + column + " | value |\n|---|---|\n", "\n\n") + "\n";
   std::vector<std::pair<std::string, std::string>> rows;
   for (size_t at = 0, end; (end = text.find('\n', at)) != std::string::npos; at = end + 1) {
     const std::string line = text.substr(at, end - at);
@@ -55,17 +37,19 @@ class UploadProtocolTest : public UploadFixture {
 
   // The post of the example.
   URLRequest postExample() {
-    givenFile(example("content") + "\n", kExamplePath);
-    makeUploadBackend(example("url"))->setUdid("A5D0AEE2");
+    givenFile(_page.example("content") + "\n", kExamplePath);
+    makeUploadBackend(_page.example("url"))->setUdid("A5D0AEE2");
     EXPECT_TRUE(upload(kExamplePath));
     return helper().requests.empty() ? URLRequest() : helper().requests.back();
   }
+
+  const ProtocolPage _page{"upload-protocol.md"};
 };
 
 TEST_F(UploadProtocolTest, theTablesAreWhatIsSentAndInThatOrder) {
   const URLRequest request = postExample();
   std::string query;
-  for (const auto& [name, value] : tableOf("parameter")) {
+  for (const auto& [name, value] : tableOf(_page, "parameter")) {
     query += (query.empty() ? "" : "&") + name + "=";
     query += value.starts_with('`') ? value.substr(1, value.size() - 2) : "";
   }
@@ -78,24 +62,20 @@ TEST_F(UploadProtocolTest, theTablesAreWhatIsSentAndInThatOrder) {
   EXPECT_EQ(query, sent);
   std::vector<std::pair<std::string, std::string>> headers;
   for (const URLRequest::Header& header : request.headers) headers.emplace_back(header.name, "`" + header.value + "`");
-  EXPECT_EQ(tableOf("header"), headers);
+  EXPECT_EQ(tableOf(_page, "header"), headers);
 }
 
 TEST_F(UploadProtocolTest, theExampleIsAPostByteForByte) {
   const URLRequest request = postExample();
-  EXPECT_EQ(example("request"), request.url);
-  std::string headers;
-  for (const URLRequest::Header& header : request.headers) {
-    headers += (headers.empty() ? "" : "\n") + header.name + ": " + header.value;
-  }
-  EXPECT_EQ(example("headers"), headers);
-  EXPECT_EQ(compression::inflate(bytesOf(example("body")), 1000)->view(), example("content") + "\n");
+  EXPECT_EQ(_page.example("request"), request.url);
+  EXPECT_EQ(_page.example("headers"), headerLines(request));
+  EXPECT_EQ(compression::inflate(bytesOf(_page.example("body")), 1000)->view(), _page.example("content") + "\n");
   const std::string sent(bodyBytes(request).view());
   // Another zlib may choose other codes; the frame is the same everywhere.
-  const std::string written = bytesOf(example("body"));
+  const std::string written = bytesOf(_page.example("body"));
   EXPECT_EQ(sent.substr(0, 10), written.substr(0, 10));
   EXPECT_EQ(sent.substr(sent.size() - 8), written.substr(written.size() - 8));
-  EXPECT_EQ(RecordingConnectivity::bodyText(request), example("content") + "\n");
+  EXPECT_EQ(RecordingConnectivity::bodyText(request), _page.example("content") + "\n");
 }
 
 }  // namespace
