@@ -1,6 +1,7 @@
 #include "backends/VDRBackend.h"
 
 #include <string_view>
+#include <utility>
 
 #include "interfaces/ClientTypes.h"
 #include "interfaces/SessionKeys.h"
@@ -14,11 +15,16 @@ constexpr std::string_view kAdaptorClass = "VDRAdaptor";
 constexpr std::string_view kForwardingSelector = "sendMessageWithMethod:respCode:dict:";
 constexpr uint32_t kNoClientType = 0;
 
-// What the client sent: beside it, the daemon's own messages carry what their hierarchy shares. A one-shot message is
-// not wrapped.
-const Dictionary& sentByClient(const Dictionary& blob) {
-  const Dictionary* const clientData = blob[kTelvaneMessageBlobClientData].dictionary();
-  return clientData != nullptr ? *clientData : blob;
+// What the client sent with this message. A session wraps it and lays beside it what the hierarchy shares, which other
+// clients may have put there; a message without a payload is then one of shared data alone, and the client sent
+// nothing. A one-shot message is not wrapped.
+Dictionary sentByClient(Dictionary blob) {
+  const bool hasClientData = blob[kTelvaneMessageBlobClientData].isDictionary();
+  const bool hasSharedData = blob[kTelvaneMessageBlobSharedData].isDictionary();
+  const bool isWrapped = blob.size() > 0 && blob.size() == (hasClientData ? 1u : 0u) + (hasSharedData ? 1u : 0u);
+  if (!isWrapped) return blob;
+  if (!hasClientData) return {};
+  return *blob[kTelvaneMessageBlobClientData].dictionary();
 }
 
 }  // namespace
@@ -61,7 +67,7 @@ bool VDRBackend::adaptorRespondsTo(std::string_view selector) const {
 std::optional<String> VDRBackend::sendMessage(Dictionary blob, Date, uint16_t method, uint16_t respCode, uint16_t,
                                               uint32_t) {
   if (adaptorRespondsTo(kForwardingSelector)) {
-    _vdrAdaptor->sendMessageWithMethod(method, respCode, sentByClient(blob));
+    _vdrAdaptor->sendMessageWithMethod(method, respCode, sentByClient(std::move(blob)));
   } else {
     log().error("VDRBackend(sendMessage): VDR adaptor {} does not respond to forwarding selector {}",
                 _vdrAdaptor != nullptr ? _vdrAdaptor->description() : "(null)", kForwardingSelector);

@@ -1,5 +1,6 @@
 #include "platform/system/LoadedWirelessDiagnostics.h"
 
+#include <cxxabi.h>
 #include <dlfcn.h>
 
 #include <exception>
@@ -25,7 +26,9 @@ struct AdaptorFunctions {
   decltype(&TelvaneVDRAdaptorRelease) release = nullptr;
 };
 
-// Calls into a shared object by its author, and lets nothing that it throws get out: a line in the log says what.
+// Calls into a shared object by its author, and lets nothing that it throws get out: a line in the log says what. A
+// function that ends its thread cannot be held: the runtime unwinds the thread's stack like an exception, and ends the
+// process at once when somebody catches that and goes on. So it passes, and the log's last line says who was to blame.
 class ForeignCode {
  public:
   ForeignCode(std::string path, Log& log) : _path(std::move(path)), _log(log) {}
@@ -38,6 +41,10 @@ class ForeignCode {
     try {
       call();
       return true;
+    } catch (const abi::__forced_unwind&) {
+      _log.error("{} of {} ended the thread that called it", function, _path);
+      _log.flush();
+      throw;
     } catch (const std::exception& thrown) {
       _log.error("{} of {} threw an exception: {}", function, _path, thrown.what());
     } catch (...) {
@@ -71,9 +78,11 @@ class LoadedAdaptor final : public WirelessDiagnosticsAdaptor {
   }
 
   void sendMessageWithMethod(uint16_t method, uint16_t respCode, const Dictionary& dict) override {
-    const propertylist::OwnedNode node(propertylist::newNode(dict));
-    _code.call("TelvaneVDRAdaptorSendMessage",
-               [&] { _functions.sendMessage(_instance, method, respCode, node.get()); });
+    // Making the node is part of the call: for lack of memory the event is lost, and nothing else.
+    _code.call("TelvaneVDRAdaptorSendMessage", [&] {
+      const propertylist::OwnedNode node(propertylist::newNode(dict));
+      _functions.sendMessage(_instance, method, respCode, node.get());
+    });
   }
 
  private:

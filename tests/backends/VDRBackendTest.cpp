@@ -89,15 +89,31 @@ TEST_F(VDRBackendTest, handsOverWhatTheClientSentAndNothingElse) {
   EXPECT_EQ(messages[0].adaptor, std::string("<VDRAdaptor of ") + kBundle + ">");
 }
 
-TEST_F(VDRBackendTest, handsOverAMessageWithoutClientDataAsItIs) {
+TEST_F(VDRBackendTest, handsOverAnEmptyMessageWhereTheClientSentNoPayloadAndNotWhatItsHierarchyShares) {
   givenAdaptor();
   const auto backend = newVDRBackend(7);
-  sendBlob(*backend, {{Key("bare"), true}});
+  sendBlob(*backend, {{kTelvaneMessageBlobSharedData, Dictionary{{Key("call"), "a"}}}});
   sendBlob(*backend, {});
   const auto messages = diagnostics().messages();
   ASSERT_EQ(messages.size(), 2u);
-  EXPECT_EQ(messages[0].dict, (Dictionary{{Key("bare"), true}}));
-  EXPECT_TRUE(messages[1].dict.empty());
+  EXPECT_EQ(messages[0].dict, Dictionary());
+  EXPECT_EQ(messages[1].dict, Dictionary());
+}
+
+// Whatever its keys are called: only a session's own wrapping is taken off.
+TEST_F(VDRBackendTest, handsOverAMessageOfItsOwnShapeAsItIs) {
+  givenAdaptor();
+  const auto backend = newVDRBackend(7);
+  const std::vector<Dictionary> sent{
+      {{Key("bare"), true}},
+      {{kTelvaneMessageBlobClientData, "text"}},
+      {{kTelvaneMessageBlobSharedData, 5}},
+      {{kTelvaneMessageBlobClientData, Dictionary{{Key("n"), 1}}}, {Key("more"), 2}},
+      {{kTelvaneMessageBlobClientData, Dictionary{{Key("n"), 1}}}, {kTelvaneMessageBlobSharedData, 5}}};
+  for (const Dictionary& message : sent) {
+    sendBlob(*backend, message);
+    EXPECT_EQ(diagnostics().messages().back().dict, message);
+  }
 }
 
 TEST_F(VDRBackendTest, handsOverTheLargestNumbers) {

@@ -22,10 +22,11 @@
  * Life: the object is loaded with the first session that needs it and stays until the daemon ends, so it may have
  * threads. It runs with the daemon's rights: who may write it, or a folder above it, has these.
  *
- * Failure: no function may end the process. A C++ exception that leaves one of them is caught and logged, and the call
- * counts as refused (no instance, no such selector, event lost). That cannot help where the runtime ends the process
- * before: when an exception leaves a function that is declared noexcept, a thread of the object's own, or the
- * constructor of a static object.
+ * Failure: no function may end the process, nor the thread that calls it (pthread_exit, pthread_cancel), which ends
+ * the process, too: the daemon's threads serve others behind the call. A C++ exception that leaves one of them is
+ * caught and logged, and the call counts as refused (no instance, no such selector, event lost). That cannot help where
+ * the runtime ends the process before: when an exception leaves a function that is declared noexcept, a thread of the
+ * object's own, or the constructor of a static object.
  */
 
 #include <plist/plist.h>

@@ -6,6 +6,7 @@
 
 #include <filesystem>
 #include <memory>
+#include <thread>
 
 #include "platform/PropertyList.h"
 #include "tests/platform/system/Expect.h"
@@ -160,6 +161,23 @@ TEST_F(LoadedWirelessDiagnosticsTest, whatAnAdaptorThrowsEndsInTheLog) {
   EXPECT_FALSE(adaptor->respondsTo("unknown"));
   _log.expectError("TelvaneVDRAdaptorRelease of " + object() + " threw an exception: released too often");
   adaptor.reset();
+}
+
+// Caught and not passed on, the runtime's own way to end a thread would end the process without a word.
+TEST_F(LoadedWirelessDiagnosticsTest, anAdaptorThatEndsItsThreadIsNamedAndTheThreadGoes) {
+  givenAdaptor("ThrowingAdaptor");
+  const auto adaptor = newAdaptor();
+  ASSERT_NE(adaptor, nullptr);
+  const std::string line = "TelvaneVDRAdaptorSendMessage of " + object() + " ended the thread that called it";
+  _log.expectError(line);
+  _log.expectError("TelvaneVDRAdaptorRelease of " + object() + " threw an exception: released too often");
+  bool hasComeBack = false;
+  std::thread([&] {
+    adaptor->sendMessageWithMethod(2, 0, {});
+    hasComeBack = true;
+  }).join();
+  EXPECT_FALSE(hasComeBack);
+  EXPECT_EQ(_log.count(LogLevel::Error, line), 1u);
 }
 
 TEST_F(LoadedWirelessDiagnosticsTest, aClassThatThrowsWhenItIsMadeMakesNoInstance) {
