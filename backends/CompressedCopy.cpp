@@ -30,13 +30,12 @@ bool store(std::string& compressed, TemporaryFile& file) {
 
 }  // namespace
 
-CompressedCopy compressedCopyOf(const SandboxExtension& extension, FileSystem& files,
+CompressedCopy compressedCopyOf(const SandboxExtension& extension, uint64_t size, FileSystem& files,
                                 const std::function<bool()>& isCancelled) {
   using Outcome = CompressedCopy::Outcome;
-  const Result<uint64_t> size = extension.size();
-  if (size.has_error() || *size == 0) return {Outcome::NothingToRead, nullptr};
+  if (size == 0) return {Outcome::NothingToRead, nullptr};
   std::string buffer(kPieceBytes, '\0');
-  std::optional<std::string_view> piece = nextPiece(extension, 0, *size, buffer);
+  std::optional<std::string_view> piece = nextPiece(extension, 0, size, buffer);
   if (!piece.has_value() || piece->empty()) return {Outcome::NothingToRead, nullptr};
   auto deflater = compression::Deflater::make(compression::Framing::Gzip);
   Result<std::unique_ptr<TemporaryFile>> file = files.newTemporaryFile(kFolder);
@@ -46,8 +45,8 @@ CompressedCopy compressedCopyOf(const SandboxExtension& extension, FileSystem& f
     if (isCancelled()) return {};
     offset += piece->size();
     if (deflater->add(*piece, compressed).has_error() || !store(compressed, **file)) return {};
-    if (offset == *size) break;
-    piece = nextPiece(extension, offset, *size, buffer);
+    if (offset == size) break;
+    piece = nextPiece(extension, offset, size, buffer);
     if (!piece.has_value()) return {Outcome::NothingToRead, nullptr};
   }
   if (deflater->finish(compressed).has_error() || !store(compressed, **file)) return {};

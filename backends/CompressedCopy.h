@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstdint>
 #include <functional>
 #include <memory>
 
@@ -18,11 +19,11 @@ struct CompressedCopy {
 };
 
 // Copies a client's file, compressed with gzip, into a temporary file of the daemon, piece by piece: of a file of any
-// size less than half a MiB is in memory at a time. The file counts as large as it is when this is called: what it
-// grows by meanwhile is left out, and of one that shrinks goes what is there. NothingToRead: it is empty, or cannot be
-// read to its end. NotMade: there is no room for the copy.
+// size less than half a MiB is in memory at a time. size: how large the caller found the file, which its bound on all
+// uploads rests on: what the file has grown by since is left out, and of one that has shrunk goes what is there.
+// NothingToRead: it is empty, or cannot be read to its end. NotMade: there is no room for the copy.
 // isCancelled: asked before each piece; once it says yes, the copy is NotMade.
-CompressedCopy compressedCopyOf(const SandboxExtension& extension, FileSystem& files,
+CompressedCopy compressedCopyOf(const SandboxExtension& extension, uint64_t size, FileSystem& files,
                                 const std::function<bool()>& isCancelled);
 
 }  // namespace telvane

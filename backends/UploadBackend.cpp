@@ -93,19 +93,22 @@ UploadBackend::UploadBackend(const ProcessContext& context, String name, Diction
 bool UploadBackend::uploadFileAtPath(const String& path, const ExtensionToken& extensionToken) {
   log().message("UploadBackend(uploadFileAtPath): Uploading file {}", path);
   if (_uploadURL.empty()) return false;
+  const auto answer = std::make_shared<ServerAnswer>(_context.platform().dispatch.newSemaphore(0));
+  // The file may be on a file system of the client's own, which need not answer even to a look at it. So there is a
+  // place before the first look, and one with the file's size, as it is from then on, behind it.
+  std::optional<RunningUploads::Place> place = _context.runningUploads().begin(answer->semaphore, 0);
+  if (!place.has_value()) return refuseForLackOfRoom();
   const auto extension = _context.platform().sandboxExtensions.consume(path.str(), extensionToken);
   if (extension == nullptr || !extension->isRegularFile()) {
     log().error("UploadBackend(uploadFileAtPath): Only upload a regular file.");
     return false;
   }
-  const auto answer = std::make_shared<ServerAnswer>(_context.platform().dispatch.newSemaphore(0));
-  const Result<uint64_t> size = extension->size();
-  const auto place = _context.runningUploads().begin(answer->semaphore, size.has_value() ? *size : 0);
-  if (!place.has_value()) {
-    log().error("UploadBackend(uploadFileAtPath): Too much is being uploaded already, or the daemon is about to end");
-    return false;
-  }
-  std::optional<URLRequest> request = newRequest(path, *extension, *place);
+  const Result<uint64_t> found = extension->size();
+  const uint64_t size = found.has_value() ? *found : 0;
+  place.reset();
+  const auto placeForAll = _context.runningUploads().begin(answer->semaphore, size);
+  if (!placeForAll.has_value()) return refuseForLackOfRoom();
+  std::optional<URLRequest> request = newRequest(path, *extension, size, *placeForAll);
   if (!request.has_value()) return false;
   const auto helper = _reportingSessionConnectivityDelegate.lock();
   if (helper == nullptr) return true;
@@ -126,10 +129,15 @@ bool UploadBackend::uploadFileAtPath(const String& path, const ExtensionToken& e
   return true;
 }
 
+bool UploadBackend::refuseForLackOfRoom() const {
+  log().error("UploadBackend(uploadFileAtPath): Too much is being uploaded already, or the daemon is about to end");
+  return false;
+}
+
 std::optional<URLRequest> UploadBackend::newRequest(const String& path, const SandboxExtension& extension,
-                                                    const RunningUploads::Place& place) const {
+                                                    uint64_t size, const RunningUploads::Place& place) const {
   CompressedCopy copy =
-      compressedCopyOf(extension, _context.platform().files, [&place] { return place.isCancelled(); });
+      compressedCopyOf(extension, size, _context.platform().files, [&place] { return place.isCancelled(); });
   if (copy.outcome == CompressedCopy::Outcome::NothingToRead) {
     log().error("UploadBackend(uploadFileAtPath): Input file is empty");
   }

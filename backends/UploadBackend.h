@@ -35,8 +35,11 @@ class UploadBackend final : public TelvaneBackend {
  private:
   UploadBackend(const ProcessContext& context, String name, Dictionary profile, String productFamily, String uploadURL);
 
-  // Nothing, with an error line where there is one to write, when the file is refused.
-  std::optional<URLRequest> newRequest(const String& path, const SandboxExtension& extension,
+  // Writes the error line, and returns false.
+  bool refuseForLackOfRoom() const;
+  // Nothing, with an error line where there is one to write, when the file is refused. size: of the file, when a place
+  // was taken for it.
+  std::optional<URLRequest> newRequest(const String& path, const SandboxExtension& extension, uint64_t size,
                                        const RunningUploads::Place& place) const;
   std::string requestURL(const String& path) const;
   struct ServerAnswer;

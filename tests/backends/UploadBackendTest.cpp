@@ -244,6 +244,23 @@ TEST_F(UploadBackendTest, refusesInSilenceWhatItHasNoRoomFor) {
   EXPECT_EQ(helper().requests.size(), 0u);
 }
 
+// Its file system may be the client's own, and never answer: what hangs there must be counted, too.
+TEST_F(UploadBackendTest, looksAtNoFileForWhichThereIsNoPlace) {
+  process().files().createDirectory(kPath).value();
+  makeUploadBackend();
+  std::vector<RunningUploads::Place> others;
+  for (size_t i = 0; i < RunningUploads::kMostAtOnce; ++i) {
+    others.push_back(*context().runningUploads().begin(process().platform().dispatch.newSemaphore(0), 0));
+  }
+  log().expectError("UploadBackend(uploadFileAtPath): Too much is being uploaded already");
+  EXPECT_FALSE(upload());
+  EXPECT_TRUE(hasNoLine(log(), kOnlyRegular));
+  others.pop_back();
+  log().expectError(kOnlyRegular);
+  EXPECT_FALSE(upload()) << "and that is its own place";
+  EXPECT_TRUE(hasLines(log(), 1, kOnlyRegular));
+}
+
 TEST_F(UploadBackendTest, refusesAURLThatNoRequestCanGoTo) {
   const std::string line = "UploadBackend(uploadFileAtPath): Unable to create URL request";
   log().expectError(line);
