@@ -39,8 +39,16 @@ class UploadStore::Sink final : public HTTPServer::BodySink {
   Result<std::unique_ptr<ReceivedFile>> _file;
 };
 
+// Drops what comes. To refuse it at once would be cheaper, but a device that is still sending when its connection ends
+// may never read the answer.
+class UploadStore::DroppingSink final : public HTTPServer::BodySink {
+ public:
+  int take(std::string_view) override { return 0; }
+};
+
 std::shared_ptr<HTTPServer::BodySink> UploadStore::newSink() const {
-  return _folder.empty() ? nullptr : std::make_shared<Sink>(ReceivedFile::begin(_folder));
+  if (_folder.empty()) return std::make_shared<DroppingSink>();
+  return std::make_shared<Sink>(ReceivedFile::begin(_folder));
 }
 
 HTTPServer::Response UploadStore::take(Kind kind, const HTTPServer::Request& request) {

@@ -24,7 +24,7 @@ class UploadStore {
   // files. listener: may be empty.
   UploadStore(std::string folder, Listener listener) : _folder(std::move(folder)), _listener(std::move(listener)) {}
 
-  // Returns what takes the body of the upload; null when there is no folder.
+  // Returns what takes the body of the upload; without a folder it drops it, whatever its size.
   std::shared_ptr<HTTPServer::BodySink> newSink() const;
   // Keeps what the request's sink has taken, and answers: a file with JSON whose "result" is "success", log data with
   // the location where they are kept, as text; 403 without a folder, 500 when they cannot be kept (the listener hears
@@ -38,6 +38,7 @@ class UploadStore {
 
  private:
   class Sink;
+  class DroppingSink;
   HTTPServer::Response cannotKeep(const Error& error);
   HTTPServer::Response kept(Kind kind, const HTTPServer::Request& request, const std::string& name, uint64_t size);
 

@@ -3,6 +3,7 @@
 #include "collector/Collector.h"
 #include "platform/dispatch/ThreadedDispatch.h"
 #include "platform/system/Environment.h"
+#include "platform/system/FileSizeSignal.h"
 #include "platform/system/PosixFileSystem.h"
 #include "platform/system/TerminationSignals.h"
 
@@ -19,6 +20,7 @@ void sayLoss(const telvane::CollectorOptions& options) {
 
 int main(int argc, char** argv) {
   using namespace telvane;
+  takeFileSizeLimitAsError();
   TerminationSignals signals;
   const auto parsed = parseCollectorOptions(argc, argv);
   if (const int* status = std::get_if<int>(&parsed)) return *status;

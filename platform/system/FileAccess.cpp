@@ -134,6 +134,15 @@ Result<void> overwrite(const std::string& path, const Data& data, mode_t mode) {
   return {};
 }
 
+Result<FileDescriptor> openWithoutName(const std::string& folder) {
+  constexpr mode_t kOwnerOnly = 0600;
+  FileDescriptor file(::open(folder.c_str(), O_TMPFILE | O_RDWR | O_CLOEXEC, kOwnerOnly));
+  if (file.isOpen()) return file;
+  // Kernels and file systems that do not know the flag take the folder itself for what is to be opened.
+  const bool isUnknown = errno == EOPNOTSUPP || errno == EISDIR || errno == EINVAL;
+  return errnoError(isUnknown ? EOPNOTSUPP : errno, "Cannot make a file in " + folder);
+}
+
 Result<void> createDirectory(const std::string& path) {
   std::error_code failure;
   std::filesystem::create_directories(path, failure);

@@ -7,6 +7,7 @@
 
 #include "foundation/Data.h"
 #include "foundation/Error.h"
+#include "platform/system/FileDescriptor.h"
 
 // Whole files by real path, for the classes of this folder. Errors are of kPlatformErrorDomain with errno as code.
 namespace telvane::fileaccess {
@@ -35,6 +36,9 @@ Result<Content> read(const std::string& path, uint64_t maximumSize);
 Result<void> replace(const std::string& path, const Data& data, mode_t mode);
 // Writes over the file or makes it.
 Result<void> overwrite(const std::string& path, const Data& data, mode_t mode);
+// Opens a new file that has no name, to be read and written, mode 0600; it goes with its last descriptor, whatever ends
+// the process. EOPNOTSUPP where the folder's file system has no such files.
+Result<FileDescriptor> openWithoutName(const std::string& folder);
 // Creates the folder and those above it.
 Result<void> createDirectory(const std::string& path);
 

@@ -7,6 +7,7 @@
 #include <algorithm>
 #include <cerrno>
 
+#include "platform/system/FileAccess.h"
 #include "platform/system/PlatformError.h"
 
 namespace telvane {
@@ -23,12 +24,12 @@ FileDescriptor openNamedAndUnlink(const std::string& folder) {
 }  // namespace
 
 Result<std::unique_ptr<UnnamedFile>> UnnamedFile::open(const std::string& folder) {
-  constexpr mode_t kOwnerOnly = 0600;
-  FileDescriptor file(::open(folder.c_str(), O_TMPFILE | O_RDWR | O_CLOEXEC, kOwnerOnly));
-  const bool isUnknown = !file.isOpen() && (errno == EOPNOTSUPP || errno == EISDIR || errno == EINVAL);
-  if (isUnknown) file = openNamedAndUnlink(folder);
-  if (!file.isOpen()) return errnoError(errno, "Cannot make a temporary file in " + folder);
-  return std::unique_ptr<UnnamedFile>(new UnnamedFile(std::move(file)));
+  Result<FileDescriptor> file = fileaccess::openWithoutName(folder);
+  if (file) return std::unique_ptr<UnnamedFile>(new UnnamedFile(std::move(*file)));
+  if (file.error().code() != EOPNOTSUPP) return file.error();
+  FileDescriptor unlinked = openNamedAndUnlink(folder);
+  if (!unlinked.isOpen()) return errnoError(errno, "Cannot make a temporary file in " + folder);
+  return std::unique_ptr<UnnamedFile>(new UnnamedFile(std::move(unlinked)));
 }
 
 int64_t UnnamedFile::read(uint64_t offset, std::span<char> buffer) const {

@@ -10,6 +10,7 @@ target_sources(telvane_platform PRIVATE
   ${CMAKE_CURRENT_LIST_DIR}/FileAccess.cpp
   ${CMAKE_CURRENT_LIST_DIR}/FileDescriptor.cpp
   ${CMAKE_CURRENT_LIST_DIR}/FileRemoval.cpp
+  ${CMAKE_CURRENT_LIST_DIR}/FileSizeSignal.cpp
   ${CMAKE_CURRENT_LIST_DIR}/FileTimes.cpp
   ${CMAKE_CURRENT_LIST_DIR}/FolderClientBundle.cpp
   ${CMAKE_CURRENT_LIST_DIR}/FolderSubmittableLogs.cpp

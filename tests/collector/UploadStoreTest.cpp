@@ -107,10 +107,18 @@ TEST_F(UploadStoreTest, neverSaysTheWordThatDeletesAFileThatIsNotKept) {
 
 TEST_F(UploadStoreTest, refusesEverythingWithoutAFolder) {
   UploadStore none("", nullptr);
-  EXPECT_EQ(none.newSink(), nullptr);
-  const auto response = none.take(UploadStore::Kind::File, {});
-  EXPECT_EQ(response.status, 403);
-  EXPECT_EQ(text(response).find("success"), std::string::npos);
+  HTTPServer::Request request;
+  EXPECT_EQ(none.take(UploadStore::Kind::File, request).status, 403) << "without a body";
+  request.sink = none.newSink();
+  ASSERT_NE(request.sink, nullptr) << "a body that is gathered has a bound";
+  for (int i = 0; i < 1000; ++i) EXPECT_EQ(request.sink->take(std::string(1000, 'x')), 0);
+  for (const auto kind : {UploadStore::Kind::File, UploadStore::Kind::LogData}) {
+    const auto response = none.take(kind, request);
+    EXPECT_EQ(response.status, 403);
+    EXPECT_EQ(text(response), "uploads are not taken; start with --uploads FOLDER\n");
+  }
+  EXPECT_EQ(none.bytes(), 0u);
+  EXPECT_EQ(listing(), std::set<std::string>());
 }
 
 }  // namespace

@@ -33,7 +33,7 @@ class ReceivedFileTest : public ::testing::Test {
 
 TEST_F(ReceivedFileTest, isThereUnderItsNameOnceItIsWhole) {
   auto file = received("one ");
-  EXPECT_EQ(listing().count("log"), 0u);
+  EXPECT_EQ(listing(), std::set<std::string>()) << "a killed process would leave it behind";
   EXPECT_TRUE(succeeds(file->append("two")));
   EXPECT_EQ(file->size(), 7u);
   EXPECT_EQ(*file->keepAs("log"), "log");
@@ -63,6 +63,21 @@ TEST_F(ReceivedFileTest, doesNotFollowALinkOfThatName) {
   std::filesystem::create_symlink(_scratch.at("elsewhere"), _scratch.at("a/folder/log"));
   EXPECT_EQ(*file->keepAs("log"), "2-log");
   EXPECT_FALSE(std::filesystem::exists(_scratch.at("elsewhere")));
+}
+
+TEST_F(ReceivedFileTest, isHiddenWhereThereAreNoFilesWithoutAName) {
+  std::filesystem::create_directories(folder());
+  for (const char* kept : {"log", "2-log"}) {
+    auto file = ReceivedFile::beginUnderHiddenName(folder());
+    ASSERT_TRUE(succeeds(file));
+    EXPECT_TRUE(succeeds((*file)->append("text")));
+    const std::set<std::string> before = listing();
+    EXPECT_TRUE(before.begin()->starts_with(".receiving-")) << *before.begin();
+    EXPECT_EQ(*(*file)->keepAs("log"), kept);
+  }
+  ReceivedFile::beginUnderHiddenName(folder()).value().reset();
+  EXPECT_EQ(listing(), (std::set<std::string>{"log", "2-log"}));
+  EXPECT_EQ(_scratch.read("a/folder/2-log"), "text");
 }
 
 TEST_F(ReceivedFileTest, saysWhenThereCanBeNone) {
