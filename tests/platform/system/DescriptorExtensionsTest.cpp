@@ -4,6 +4,7 @@
 #include <grp.h>
 #include <gtest/gtest.h>
 #include <sched.h>
+#include <sys/mman.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -11,6 +12,7 @@
 
 #include <array>
 #include <cerrno>
+#include <climits>
 #include <filesystem>
 #include <functional>
 
@@ -128,10 +130,90 @@ TEST_F(DescriptorExtensionsTest, takesNoDeletedFile) {
   EXPECT_FALSE(isRegular(path + " (deleted)", token)) << "which is what the kernel calls it now";
 }
 
+// Memory of the client's, sealed or not, and a file that it has given no name: the kernel has a name for either.
+TEST_F(DescriptorExtensionsTest, takesNoFileThatNeverHadAName) {
+  _descriptors.push_back(FileDescriptor(::memfd_create("log", MFD_CLOEXEC | MFD_ALLOW_SEALING)));
+  _descriptors.push_back(FileDescriptor(::open(_folder.path().c_str(), O_TMPFILE | O_RDWR | O_CLOEXEC, 0600)));
+  for (const FileDescriptor& descriptor : _descriptors) {
+    ASSERT_TRUE(descriptor.isOpen());
+    ASSERT_EQ(::write(descriptor.get(), "x", 1), 1);
+    ::fcntl(descriptor.get(), F_ADD_SEALS, F_SEAL_SHRINK | F_SEAL_GROW | F_SEAL_WRITE);
+    const ExtensionToken token{descriptor.get(), PeerIdentity{::geteuid(), ::getegid(), {}}};
+    const std::string known = fs::read_symlink("/proc/self/fd/" + std::to_string(descriptor.get())).string();
+    ASSERT_TRUE(known.ends_with(" (deleted)")) << known;
+    EXPECT_FALSE(isRegular(known, token)) << known;
+    EXPECT_FALSE(isRegular(known.substr(0, known.rfind(' ')), token)) << known;
+  }
+}
+
+// Which are links, and stand for another file in each process that follows them.
+TEST_F(DescriptorExtensionsTest, takesNoPathThroughADescriptor) {
+  const std::string path = _folder.write("log", "x");
+  const ExtensionToken token = tokenFor(path);
+  const std::string name = std::to_string(token.descriptor);
+  for (const std::string& way : {"/proc/self/fd/" + name, "/proc/thread-self/fd/" + name,
+                                 "/proc/" + std::to_string(::getpid()) + "/fd/" + name, "/dev/fd/" + name}) {
+    ASSERT_EQ(fs::read_symlink(way), path);
+    EXPECT_FALSE(isRegular(way, token)) << way;
+    EXPECT_FALSE(consume(way, token)->removeFile().has_value()) << way;
+  }
+  EXPECT_TRUE(fs::exists(path));
+}
+
+TEST_F(DescriptorExtensionsTest, deletesNothingThroughTheRootOfAProcess) {
+  const std::string path = _folder.write("log", "x");
+  EXPECT_FALSE(consume("/proc/self/root" + path, tokenFor(path))->removeFile().has_value());
+  EXPECT_FALSE(consume("/proc/self/cwd/../../.." + path, tokenFor(path))->removeFile().has_value());
+  EXPECT_TRUE(fs::exists(path));
+}
+
+TEST_F(DescriptorExtensionsTest, takesNoPathThatIsTooLongOrNone) {
+  const std::string path = _folder.write("log", "x");
+  const ExtensionToken token = tokenFor(path);
+  std::string way = _folder.path();
+  while (way.size() < PATH_MAX) way += "/.";
+  for (const std::string& hostile : {way + "/log", std::string(), std::string("log"), path + "/", path + "/."}) {
+    EXPECT_FALSE(isRegular(hostile, token)) << hostile.size() << " bytes";
+  }
+}
+
+TEST_F(DescriptorExtensionsTest, aPipeThatTakesTheFilesPlaceIsNotWaitedFor) {
+  const std::string path = _folder.write("log", "x");
+  const ExtensionToken token = tokenFor(path);
+  const auto extension = consume(path, token);
+  fs::remove(path);
+  ASSERT_EQ(::mkfifo(path.c_str(), 0600), 0);
+  EXPECT_FALSE(extension->isRegularFile());
+  EXPECT_FALSE(extension->removeFile().has_value());
+  EXPECT_TRUE(fs::is_fifo(path));
+}
+
+TEST_F(DescriptorExtensionsTest, deletesNothingInAFolderThatTookTheFoldersPlace) {
+  const std::string path = _folder.write("folder/log", "mine");
+  const auto extension = consume(path, tokenFor(path));
+  fs::rename(_folder.at("folder"), _folder.at("moved"));
+  _folder.write("folder/log", "another");
+  EXPECT_TRUE(failsWith(extension->removeFile(), ESTALE));
+  fs::remove_all(_folder.at("folder"));
+  fs::create_directory_symlink(_folder.at("moved"), _folder.at("folder"));
+  EXPECT_FALSE(extension->removeFile().has_value()) << "through a link, though to the very file";
+  EXPECT_EQ(_folder.read("moved/log"), "mine");
+}
+
+TEST_F(DescriptorExtensionsTest, deletesOneNameOfAFileThatHasMore) {
+  const std::string path = _folder.write("log", "x");
+  fs::create_hard_link(path, _folder.at("other"));
+  EXPECT_TRUE(isRegular(_folder.at("other"), tokenFor(path)));
+  EXPECT_TRUE(succeeds(consume(_folder.at("other"), tokenFor(path))->removeFile()));
+  EXPECT_TRUE(fs::exists(path));
+  EXPECT_FALSE(fs::exists(_folder.at("other")));
+}
+
 TEST_F(DescriptorExtensionsTest, aDescriptorThatGivesNoRightToReadGivesNone) {
   const std::string path = _folder.write("log", "x");
   for (const int flags : {O_PATH, O_WRONLY}) {
     const auto extension = consume(path, tokenFor(path, flags));
+    EXPECT_FALSE(extension->isRegularFile()) << flags;
     EXPECT_EQ(readAll(*extension), "(error)") << flags;
   }
 }
@@ -298,6 +380,17 @@ TEST_F(FileRemovalForAClientTest, keepsWhatTheClientMayOnlyReadInItsOwnViewOfThe
   EXPECT_EQ(answer, 0);
   ASSERT_TRUE(fs::exists(path));
   EXPECT_TRUE(removes(path)) << "the same file, seen as the daemon sees it";
+}
+
+// A link to a stranger's file in a folder of its own: the client may delete that name, and no other.
+TEST_F(FileRemovalForAClientTest, deletesALinkToSomebodyElsesFileAndNotTheFile) {
+  makeFolder("own", kClient, kClient, 0700);
+  makeFolder("theirs", kOther, kOther, 01777);
+  const std::string theirs = makeFile("theirs/log", kOther);
+  fs::create_hard_link(theirs, _folder.at("own/log"));
+  EXPECT_FALSE(removes(theirs));
+  EXPECT_TRUE(removes(_folder.at("own/log")));
+  EXPECT_TRUE(fs::exists(theirs));
 }
 
 TEST_F(FileRemovalForAClientTest, leavesTheDaemonWithItsOwnRights) {
