@@ -116,6 +116,47 @@ Value BackendFixture::nestedTooDeep() {
   return value;
 }
 
+const std::vector<Key>& BackendFixture::clientEntryKeys() {
+  static const std::vector<Key> keys = {kClientEntryClient,
+                                        kClientEntryService,
+                                        kClientEntryExpedite,
+                                        kClientEntryEnabledSince,
+                                        kClientEntryOverrideDNU,
+                                        kClientEntryLocaleWhitelist,
+                                        kClientEntryDeviceWhitelist,
+                                        kClientEntryDeviceBlacklist,
+                                        kClientEntryFilters,
+                                        kClientEntrySamplingThreshold,
+                                        kClientEntryPerCountrySamplingThresholds,
+                                        kClientEntryOverrideSampling,
+                                        kClientEntryCustomClientId,
+                                        kClientEntryEventThreshold,
+                                        kClientEntryExtrasOnInternal,
+                                        kClientEntryPostURL,
+                                        kClientEntryRealtimePostURL,
+                                        kClientEntryEventWhitelist,
+                                        kClientEntryEventBlacklist,
+                                        kClientEntryIncludeSessionID,
+                                        kClientEntryUseWiFiOnly};
+  return keys;
+}
+
+const std::vector<Value>& BackendFixture::valuesOfAllKinds() {
+  static const std::vector<Value> values = {Value(),
+                                            true,
+                                            -1,
+                                            1e300,
+                                            "",
+                                            "text",
+                                            Data(std::string("\x00\xff", 2)),
+                                            Date(),
+                                            Array{1, 2},
+                                            Array{Value(Array{Value(Dictionary())})},
+                                            Dictionary(),
+                                            Dictionary{{kFilterKey, 1}}};
+  return values;
+}
+
 Dictionary BackendFixture::posted(Dictionary payload, uint16_t method, uint16_t respCode, uint32_t flag) {
   _backend->setBatchEvents(false);
   send(std::move(payload), method, respCode, flag);

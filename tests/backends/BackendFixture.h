@@ -5,6 +5,7 @@
 #include <cmath>
 #include <memory>
 #include <string>
+#include <vector>
 
 #include "backends/HTTPSPostBackend.h"
 #include "platform/Platform.h"
@@ -74,6 +75,9 @@ class BackendFixture : public ::testing::Test {
   Dictionary posted(Dictionary payload, uint16_t method = 7, uint16_t respCode = 2, uint32_t flag = 0);
   // A list deeper than JSON is written.
   static Value nestedTooDeep();
+  // Everything that a client entry may hold, and values of every kind that a bag can hold under it.
+  static const std::vector<Key>& clientEntryKeys();
+  static const std::vector<Value>& valuesOfAllKinds();
 
   SimulatedWorld _world;
   // What the backend is made with.

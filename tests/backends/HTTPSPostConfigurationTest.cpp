@@ -376,38 +376,8 @@ TEST_F(HTTPSPostConfigurationTest, aFrozenBackendStaysDisabledByTheServer) {
 TEST_F(HTTPSPostConfigurationTest, anyValueUnderAnyKeyIsSurvived) {
   log().allowErrors();
   const Dictionary permissive = _client;
-  const Value values[] = {Value(),
-                          true,
-                          -1,
-                          1e300,
-                          "text",
-                          Array{1, 2},
-                          Dictionary(),
-                          Date(),
-                          Data::copyOf("x"),
-                          Array{Value(Array{Value(Dictionary())})}};
-  for (const Key& key : {kClientEntryClient,
-                         kClientEntryService,
-                         kClientEntryExpedite,
-                         kClientEntryEnabledSince,
-                         kClientEntryOverrideDNU,
-                         kClientEntryLocaleWhitelist,
-                         kClientEntryDeviceWhitelist,
-                         kClientEntryDeviceBlacklist,
-                         kClientEntryFilters,
-                         kClientEntrySamplingThreshold,
-                         kClientEntryPerCountrySamplingThresholds,
-                         kClientEntryOverrideSampling,
-                         kClientEntryCustomClientId,
-                         kClientEntryEventThreshold,
-                         kClientEntryExtrasOnInternal,
-                         kClientEntryPostURL,
-                         kClientEntryRealtimePostURL,
-                         kClientEntryEventWhitelist,
-                         kClientEntryEventBlacklist,
-                         kClientEntryIncludeSessionID,
-                         kClientEntryUseWiFiOnly}) {
-    for (const Value& value : values) {
+  for (const Key& key : clientEntryKeys()) {
+    for (const Value& value : valuesOfAllKinds()) {
       _client = permissive;
       _client.set(key, value);
       makeBackend();

@@ -149,37 +149,8 @@ TEST_F(StorebagExplainDecisionsTest, saysWhyEarlierEntriesAreSkipped) {
 TEST_F(StorebagExplainDecisionsTest, bearsAnyKindOfValueUnderAnyKeyAsARealBackendDoes) {
   log().allowErrors();
   const Dictionary open = _client;
-  const std::vector<Value> kinds = {true,
-                                    -1,
-                                    1e300,
-                                    "",
-                                    "text",
-                                    Data(std::string("\x00\xff", 2)),
-                                    Date(),
-                                    Array{Value(Array{1})},
-                                    Dictionary{{kFilterKey, 1}}};
-  for (const Key& key : {kClientEntryClient,
-                         kClientEntryService,
-                         kClientEntryExpedite,
-                         kClientEntryEnabledSince,
-                         kClientEntryOverrideDNU,
-                         kClientEntryLocaleWhitelist,
-                         kClientEntryDeviceWhitelist,
-                         kClientEntryDeviceBlacklist,
-                         kClientEntryFilters,
-                         kClientEntrySamplingThreshold,
-                         kClientEntryPerCountrySamplingThresholds,
-                         kClientEntryOverrideSampling,
-                         kClientEntryCustomClientId,
-                         kClientEntryEventThreshold,
-                         kClientEntryExtrasOnInternal,
-                         kClientEntryPostURL,
-                         kClientEntryRealtimePostURL,
-                         kClientEntryEventWhitelist,
-                         kClientEntryEventBlacklist,
-                         kClientEntryIncludeSessionID,
-                         kClientEntryUseWiFiOnly}) {
-    for (const Value& value : kinds) {
+  for (const Key& key : clientEntryKeys()) {
+    for (const Value& value : valuesOfAllKinds()) {
       SCOPED_TRACE(std::string(key.view()) + " " + description(value));
       _client = open;
       _client.set(key, value);
