@@ -3,12 +3,20 @@
 #include <gmock/gmock.h>
 
 #include <algorithm>
+#include <array>
 #include <csignal>
 #include <map>
+#include <optional>
+#include <set>
 #include <sstream>
 
+#include "bench/KeptConnection.h"
+#include "foundation/Description.h"
+#include "interfaces/EventKeys.h"
 #include "interfaces/StorebagKeys.h"
+#include "platform/JSON.h"
 #include "platform/KeyedArchive.h"
+#include "tests/endtoend/DatagramRelay.h"
 #include "tests/endtoend/LiveDashboard.h"
 #include "tests/endtoend/WireFixture.h"
 
@@ -188,35 +196,232 @@ TEST_F(DashboardTest, isToldWhereUploadedLogDataLie) {
   stopDaemon();
 }
 
-// The collector as the dashboard, over a network that loses every tenth datagram and acknowledgement.
-class DashboardCollectorTest : public ::testing::Test {
+// A dashboard that never acknowledges: what the schedule says happens to everything.
+class SilentDashboardTest : public DashboardTest {
  protected:
-  Instance _instance;
+  static constexpr int kTransmissions = 5;
+
+  // Copies of the event with that ID.
+  int copiesOf(uint16_t eventID) const {
+    const auto datagrams = _dashboard.datagrams();
+    return static_cast<int>(std::count_if(datagrams.begin(), datagrams.end(),
+                                          [eventID](const auto& datagram) { return datagram.eventID() == eventID; }));
+  }
+  bool comeFiveTimes(uint16_t first, uint16_t last) const {
+    return eventually([this, first, last] {
+      for (uint16_t eventID = first; eventID <= last; ++eventID) {
+        if (copiesOf(eventID) < kTransmissions) return false;
+      }
+      return true;
+    });
+  }
+  bool isWaiting(int times) {
+    return eventually([this, times] {
+      const std::string said = instance().read("client.out");
+      int count = 0;
+      for (size_t at = 0; (at = said.find("waiting\n", at)) != std::string::npos; ++at) ++count;
+      return count >= times;
+    });
+  }
+
+  const LiveDashboard _dashboard{[](LiveDashboard&, const LiveDashboard::Datagram&) {}};
 };
 
-TEST_F(DashboardCollectorTest, storesEachEventOnce) {
-  _instance.startCollector({"--events", _instance.path("events.jsonl"), "--dashboard", "127.0.0.1:0",
-                            "--dashboard-loss", "10", "--dashboard-seed", "4"});
-  const auto lineOf = [this](size_t number) {
+// In the order in which they were sent, each time. A tick may be late, never early: the n-th behind an event comes n -
+// 1 whole periods later at the soonest.
+TEST_F(SilentDashboardTest, getsEachEventFiveTimesAtTheTimesOfTheSchedule) {
+  constexpr std::chrono::milliseconds kTestPeriod{150};
+  constexpr std::array<int, kTransmissions> kTicks = {0, 2, 5, 10, 19};
+  givenDashboardAt(_dashboard.port(), kTestPeriod.count());
+  startDaemon();
+  ClientScript script;
+  script.open(sessionInfo(), userInfo()).configure().wait();
+  for (int n = 0; n < kEvents; ++n) script.send(kEvent, 1, Dictionary{{Key("n"), n}});
+  const auto client = start(script.wait());
+  ASSERT_TRUE(isWaiting(1));
+  const auto begin = LiveDashboard::Clock::now();
+  client->writeLine();
+  // The session's start is event 1.
+  ASSERT_TRUE(comeFiveTimes(2, kEvents + 1)) << instance().daemonLog();
+  // What ends the session is sent as often, which takes as long again.
+  expectEnd(*client);
+  ASSERT_TRUE(comeFiveTimes(kEvents + 2, kEvents + 2)) << instance().daemonLog();
+  EXPECT_THAT(copies(_dashboard, kEvent), Each(kTransmissions)) << "and then no more";
+  std::map<int, std::vector<uint16_t>> orderOfCopies;
+  for (const LiveDashboard::Datagram& datagram : _dashboard.datagrams(kEvent)) {
+    orderOfCopies[datagram.copy].push_back(datagram.eventID());
+    const int ticks = kTicks.at(static_cast<size_t>(datagram.copy) - 1);
+    EXPECT_GE(datagram.at - begin, kTestPeriod * std::max(ticks - 1, 0))
+        << "copy " << datagram.copy << " of event " << datagram.eventID();
+  }
+  ASSERT_EQ(orderOfCopies.size(), kTicks.size()) << "each time the same bytes";
+  for (const auto& [copy, order] : orderOfCopies) EXPECT_THAT(order, ElementsAre(2, 3, 4, 5, 6)) << copy;
+}
+
+TEST_F(SilentDashboardTest, getsTheFiftyNewestEventsAgainAndNoneThatTheyDropped) {
+  constexpr uint16_t kWaiting = 50;
+  constexpr uint16_t kLast = 61;  // the session's start and 60 events
+  givenDashboardAt(_dashboard.port(), 200);
+  startDaemon();
+  ClientScript script = sending(kLast - 1);
+  const auto client = start(script.wait());
+  ASSERT_TRUE(comeFiveTimes(kLast - kWaiting + 1, kLast)) << instance().daemonLog();
+  expectEnd(*client);
+  stopDaemon();
+  std::map<uint16_t, std::pair<size_t, size_t>> firstAndLast;
+  const auto datagrams = _dashboard.datagrams();
+  for (size_t at = 0; at < datagrams.size(); ++at) {
+    firstAndLast.try_emplace(datagrams[at].eventID(), at, at).first->second.second = at;
+  }
+  for (uint16_t eventID = 1; eventID <= kLast; ++eventID) {
+    ASSERT_EQ(firstAndLast.count(eventID), 1u) << eventID;
+    if (eventID > kLast - kWaiting) {
+      EXPECT_EQ(copiesOf(eventID), kTransmissions) << eventID;
+    } else {
+      EXPECT_LT(copiesOf(eventID), kTransmissions) << eventID;
+      EXPECT_LT(firstAndLast[eventID].second, firstAndLast[eventID + kWaiting].first)
+          << eventID << " came again although it was dropped";
+    }
+  }
+}
+
+// Whatever is not acknowledged by then.
+TEST_F(SilentDashboardTest, isLetGoOf9500MillisecondsAfterTheSessionsEnd) {
+  givenDashboardAt(_dashboard.port(), 1000);
+  startDaemon();
+  ClientScript script = sending(1);
+  const auto client = start(script.wait());
+  ASSERT_TRUE(eventually([this] { return copiesOf(2) == 1; })) << instance().daemonLog();
+  const auto end = LiveDashboard::Clock::now();
+  expectEnd(*client);
+  const std::string line = "DashboardBackend(myPeriodicTask): scheduled last resort clean-up in 9500 ms.";
+  ASSERT_TRUE(eventually([&] { return instance().daemonLogHas(line); })) << instance().daemonLog();
+  EXPECT_TRUE(isUDPSocketConnectedTo(_dashboard.port())) << "the daemon's is open as long";
+  ASSERT_TRUE(eventually([this] { return !isUDPSocketConnectedTo(_dashboard.port()); })) << instance().daemonLog();
+  EXPECT_GE(LiveDashboard::Clock::now() - end, std::chrono::milliseconds(9500));
+  const std::string log = instance().daemonLog();
+  EXPECT_EQ(log.find(line), log.rfind(line)) << "once";
+  EXPECT_FALSE(instance().daemonLogHas("DashboardBackend(myPeriodicTask): clean up at myPeriodicTask."));
+  EXPECT_GE(copiesOf(3), 2) << "the session's stop came again meanwhile";
+  EXPECT_LT(copiesOf(3), kTransmissions) << "but not to the end of the schedule";
+  stopDaemon();
+}
+
+// The same bytes from the same port of another address end no wait; those from the dashboard itself do.
+TEST_F(DashboardTest, isAloneInAcknowledging) {
+  Mutex mutex;
+  std::unique_ptr<DatagramServer> stranger;
+  int strangersAcknowledgements = 0;
+  LiveDashboard dashboard([&](LiveDashboard& self, const LiveDashboard::Datagram& datagram) {
+    if (datagram.copy == 3) return self.acknowledge(datagram);
+    const std::string bytes = LiveDashboard::acknowledgementOf(datagram);
+    MutexLock lock(mutex);
+    if (stranger->send(datagram.peer, {reinterpret_cast<const uint8_t*>(bytes.data()), bytes.size()})) {
+      ++strangersAcknowledgements;
+    }
+  });
+  auto started = DatagramServer::start({{127, 0, 0, 2}, dashboard.port()}, [](auto&&...) {});
+  ASSERT_TRUE(started.has_value()) << started.error().description();
+  {
+    MutexLock lock(mutex);
+    stranger = std::move(*started);
+  }
+  givenDashboardAt(dashboard.port(), 200);
+  startDaemon();
+  EXPECT_THAT(run(sending()), HasSubstr("configured: [dashboard]"));
+  ASSERT_TRUE(eventually([&dashboard] { return !isUDPSocketConnectedTo(dashboard.port()); })) << instance().daemonLog();
+  for (const uint16_t category : {uint16_t{0}, kEvent}) EXPECT_THAT(copies(dashboard, category), Each(3));
+  EXPECT_EQ(dashboard.datagrams().size(), 3u * (kEvents + 2));
+  stopDaemon();
+  MutexLock lock(mutex);
+  EXPECT_EQ(strangersAcknowledgements, 2 * (kEvents + 2));
+}
+
+// The collector as the dashboard, over a network that loses datagrams and acknowledgements.
+class DashboardCollectorTest : public ::testing::Test {
+ protected:
+  // Every twentieth. Whatever the order in which datagrams come, among the first 22 one gets lost and the
+  // acknowledgement of another; and among the 110 that may come at most, five times each, fewer than five do in all. So
+  // no event is lost however slow the machine is, and both kinds of loss are seen.
+  static constexpr char kLossPercent[] = "5";
+  static constexpr char kSeed[] = "117";
+  static constexpr int kSent = 20;
+  static constexpr int64_t kAll = kSent + 2;  // with the session's start and stop
+
+  // Starts a collector that loses, and what stands before it.
+  void startLosingCollector() {
+    _instance.startCollector({"--events", _instance.path("events.jsonl"), "--dashboard", "127.0.0.1:0",
+                              "--dashboard-loss", kLossPercent, "--dashboard-seed", kSeed});
+    ASSERT_TRUE(
+        eventually([this] { return lineOf(3).find("--dashboard-seed " + std::string(kSeed)) != std::string::npos; }));
+    const std::string address = lineOf(2);
+    const auto port = static_cast<uint16_t>(std::stoi(address.substr(address.rfind(':') + 1)));
+    _relay.emplace(IPv4SocketAddress{{127, 0, 0, 1}, port});
+  }
+  std::string lineOf(size_t number) const {
     std::istringstream lines(_instance.read("collector.out"));
     std::string line;
     for (size_t count = 0; count < number; ++count) std::getline(lines, line);
     return line;
-  };
-  ASSERT_TRUE(eventually([&lineOf] { return lineOf(3).find("--dashboard-seed 4") != std::string::npos; }));
-  const std::string address = lineOf(2);
-  const auto port = std::stoi(address.substr(address.rfind(':') + 1));
-  Dictionary bag = openBag(_instance.collectorURL("/events"));
-  Dictionary section;
-  section.set("dashboard", Dictionary{{kProfileIP, "127.0.0.1"}, {kProfilePort, port}, {kProfileReliable, 20}});
-  bag.set(kEnvironmentRelease, section);
-  _instance.givenStorebag("conferencing", bag);
+  }
+  void givenBag() {
+    Dictionary bag = openBag(_instance.collectorURL("/events"));
+    Dictionary section;
+    section.set("dashboard",
+                Dictionary{{kProfileIP, "127.0.0.1"}, {kProfilePort, _relay->port()}, {kProfileReliable, 100}});
+    bag.set(kEnvironmentRelease, section);
+    _instance.givenStorebag("conferencing", bag);
+  }
+  // What the collector says of itself; an empty dictionary when it says nothing.
+  Dictionary statistics() {
+    bench::KeptConnection collector(_instance.collectorURL("/statistics"), _instance.authorityFile(), {});
+    const Result<Value> parsed = json::parse(collector.get().value_or(""));
+    if (parsed.has_error() || !parsed->isDictionary()) return {};
+    const Dictionary* counts = (*parsed->dictionary())["dashboard"].dictionary();
+    return counts != nullptr ? *counts : Dictionary();
+  }
+  static std::set<int64_t> eventIDsOf(const std::vector<Dictionary>& lines) {
+    std::set<int64_t> eventIDs;
+    for (const Dictionary& line : lines)
+      eventIDs.insert((*line["event"].dictionary())[kEventEventNumber].integerValue());
+    return eventIDs;
+  }
+
+  Instance _instance;
+  std::optional<DatagramRelay> _relay;
+};
+
+TEST_F(DashboardCollectorTest, storesEachEventOnceAndCountsWhatItLoses) {
+  startLosingCollector();
+  givenBag();
   _instance.startDaemon();
-  EXPECT_THAT(_instance.sendEvents({"--count", "20"}), HasSubstr("configured: [dashboard]"));
-  EXPECT_TRUE(eventually([this] { return _instance.arrivedWithCategory(21).size() >= 20; })) << _instance.daemonLog();
-  const auto lines = _instance.arrivedWithCategory(21);
-  EXPECT_EQ(lines.size(), 20u);
-  EXPECT_TRUE(eventually([this] { return _instance.read("collector.out").find(" method 21 ") != std::string::npos; }));
+  EXPECT_THAT(_instance.sendEvents({"--count", std::to_string(kSent)}), HasSubstr("configured: [dashboard]"));
+  // The session waits for its last acknowledgement. Copies that were sent before it came may still be on their way.
+  ASSERT_TRUE(eventually([this] { return !isUDPSocketConnectedTo(_relay->port()); })) << _instance.daemonLog();
+  Dictionary counted;
+  DatagramRelay::Counts relayed;
+  // Each datagram that has come to the collector is acknowledged in the end, or itself or its acknowledgement is lost.
+  ASSERT_TRUE(eventually([&] {
+    relayed = _relay->counts();
+    counted = statistics();
+    return counted["lost"].integerValue() == relayed.toServer - relayed.toClient;
+  })) << relayed.toServer
+      << " datagrams, " << relayed.toClient << " acknowledgements, " << description(counted);
+
+  EXPECT_EQ(counted["events"], Value(kAll));
+  EXPECT_EQ(counted["refused"], Value(0));
+  const int64_t lost = counted["lost"].integerValue();
+  const int64_t repeated = counted["repeated"].integerValue();
+  const int64_t lostDatagrams = relayed.toServer - kAll - repeated;
+  EXPECT_GE(lostDatagrams, 1);
+  EXPECT_GE(lost - lostDatagrams, 1) << "acknowledgements";
+  EXPECT_GE(repeated, lost - lostDatagrams) << "without its acknowledgement an event comes again";
+  EXPECT_EQ(_instance.arrived().size(), static_cast<size_t>(kAll)) << "each once";
+  EXPECT_EQ(eventIDsOf(_instance.arrived()).size(), static_cast<size_t>(kAll));
+  EXPECT_EQ(_instance.arrivedWithCategory(21).size(), static_cast<size_t>(kSent));
+  const std::string shown = _instance.read("collector.out");
+  EXPECT_THAT(shown, HasSubstr(" method 21 "));
+  EXPECT_EQ(std::count(shown.begin(), shown.end(), '\n'), 3 + kAll) << "a line for each event, behind the first three";
   _instance.daemon().signal(SIGTERM);
   EXPECT_EQ(_instance.daemon().wait(), 0);
 }

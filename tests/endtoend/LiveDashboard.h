@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <cstdint>
 #include <functional>
 #include <map>
@@ -17,10 +18,12 @@ namespace telvane::testing {
 // thread.
 class LiveDashboard {
  public:
+  using Clock = std::chrono::steady_clock;
   struct Datagram {
     std::string bytes;
     IPv4SocketAddress peer;
     int copy = 1;  // 1 for the first of its bytes, 2 for the next, …
+    Clock::time_point at;
 
     uint16_t number(size_t offset) const;
     uint16_t category() const { return number(16); }
@@ -37,6 +40,8 @@ class LiveDashboard {
 
   uint16_t port() const noexcept { return _server->address().port; }
   void acknowledge(const Datagram& datagram) const;
+  // What it acknowledges by.
+  static std::string acknowledgementOf(const Datagram& datagram) { return datagram.bytes.substr(0, 62); }
   // All that has come, in that order.
   std::vector<Datagram> datagrams() const;
   std::vector<Datagram> datagrams(uint16_t category) const;
@@ -52,5 +57,8 @@ class LiveDashboard {
   std::map<std::string, int> _copies GUARDED_BY(_mutex);
   std::unique_ptr<DatagramServer> _server;  // last, so that it ends first
 };
+
+// Whether a UDP socket of this machine sends to that port of 127.0.0.1 and to nobody else.
+bool isUDPSocketConnectedTo(uint16_t port);
 
 }  // namespace telvane::testing
