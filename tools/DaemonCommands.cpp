@@ -144,7 +144,7 @@ Result<void> DaemonCommands::handOver(ClientSession& session, const std::string&
   if (*isPosted) return {};
   return fault("the daemon refused " + file +
                ": it uploads a regular file that is not empty and no link, as far as its disk has room for a "
-               "compressed copy; its log says what it was");
+               "compressed copy; its log says what it was, but for a lack of room");
 }
 
 Result<DaemonCommands::OpenSession> DaemonCommands::openSession(const MessageOptions& options) {
