@@ -400,7 +400,7 @@ TEST_F(DashboardCollectorTest, storesEachEventOnceAndCountsWhatItLoses) {
   ASSERT_TRUE(eventually([this] { return !isUDPSocketConnectedTo(_relay->port()); })) << _instance.daemonLog();
   Dictionary counted;
   DatagramRelay::Counts relayed;
-  // Each datagram that has come to the collector is acknowledged in the end, or itself or its acknowledgement is lost.
+  // Each datagram brings an acknowledgement, unless one of the two is lost.
   ASSERT_TRUE(eventually([&] {
     relayed = _relay->counts();
     counted = statistics();
