@@ -11,6 +11,9 @@ namespace telvane::ipc {
 namespace {
 
 constexpr unsigned kMostDescriptorsPerMessage = 16;
+// Received with calls that wait to be executed. A peer of our make has at most 16 under way; what is held here is taken
+// from everybody who needs a descriptor in this process.
+constexpr size_t kMostWaitingDescriptors = 64;
 // A client needs less than half of them to ask for the line.
 constexpr size_t kMessagesBeforeAcceptance = 16;
 constexpr size_t kBytesBeforeAcceptance = 16u << 10;
@@ -35,6 +38,11 @@ Descriptor descriptorOf(wire::OpenFile::Client file) {
     return Descriptor(::fcntl(*fd, F_DUPFD_CLOEXEC, 0));
   }
   return Descriptor();
+}
+
+size_t descriptorsOf(const std::vector<IncomingCall>& calls) {
+  return static_cast<size_t>(std::count_if(
+      calls.begin(), calls.end(), [](const IncomingCall& call) { return call.invocation.descriptor.isValid(); }));
 }
 
 kj::Exception disconnected() {
@@ -89,6 +97,7 @@ class Line::AcceptorServer final : public wire::Acceptor::Server {
 struct Line::ReceivedBatch {
   DeliverContext context;
   kj::Own<kj::PromiseFulfiller<void>> fulfiller;
+  size_t descriptors = 0;  // that came with its calls
 };
 
 struct Line::Asking {
@@ -250,6 +259,10 @@ kj::Promise<void> Line::received(DeliverContext context) {
   }
   std::vector<IncomingCall> calls;
   guarded([&] { calls = decodeCalls(context.getParams()); });
+  const size_t descriptors = descriptorsOf(calls);
+  size_t waitingDescriptors = descriptors;
+  for (const auto& [earlier, batch] : _received) waitingDescriptors += batch.descriptors;
+  if (waitingDescriptors > kMostWaitingDescriptors) end("hands over too many files at once");
   if (_unanswered > _limits.maximumUnansweredCalls) end("wants too many answers at once");
   if (_hasEnded) return disconnected();
   context.releaseParams();
@@ -257,7 +270,7 @@ kj::Promise<void> Line::received(DeliverContext context) {
   if (_hasEnded) return disconnected();
   auto pair = kj::newPromiseAndFulfiller<void>();
   const uint64_t number = ++_lastReceived;
-  _received.emplace(number, ReceivedBatch{context, kj::mv(pair.fulfiller)});
+  _received.emplace(number, ReceivedBatch{context, kj::mv(pair.fulfiller), descriptors});
   _owner.lineReceived(number, std::move(calls));
   return kj::mv(pair.promise);
 }

@@ -3,6 +3,7 @@
 #include <fcntl.h>
 #include <fmt/format.h>
 #include <grp.h>
+#include <linux/capability.h>
 #include <sys/fsuid.h>
 #include <sys/statvfs.h>
 #include <sys/syscall.h>
@@ -10,6 +11,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
 #include <cstdlib>
 #include <string_view>
@@ -93,11 +95,22 @@ Result<Folder> walk(const PeerIdentity& who, const std::vector<std::string>& nam
   return folder;
 }
 
+// Whether the calling thread may do with files what their modes do not say. A thread that lays user 0 down loses that,
+// unless somebody has set the process up to keep it; and a user of any number may have been given it.
+bool mayOverrideModes() {
+  __user_cap_header_struct header{_LINUX_CAPABILITY_VERSION_3, 0};
+  std::array<__user_cap_data_struct, _LINUX_CAPABILITY_U32S_3> sets{};
+  constexpr uint32_t kOverriding = 1u << CAP_DAC_OVERRIDE | 1u << CAP_DAC_READ_SEARCH | 1u << CAP_FOWNER;
+  return ::syscall(SYS_capget, &header, sets.data()) != 0 || (sets[0].effective & kOverriding) != 0;
+}
+
 // While it lives, the calling thread meets the file system as somebody else; the process's other threads do not notice.
 class ActingAs {
  public:
   explicit ActingAs(const PeerIdentity& who) {
-    if (::geteuid() == kRoot && who.userID != kRoot) _isRefused = !takeOn(who);
+    if (who.userID == kRoot) return;
+    if (::geteuid() == kRoot) _isRefused = !takeOn(who);
+    _isRefused = _isRefused || mayOverrideModes();
   }
   ~ActingAs() {
     if (!_isChanged) return;

@@ -16,7 +16,7 @@
 // A daemon that runs as root takes on the client's user and groups for the one call that deletes, so that the kernel
 // has the last word at the moment that counts: between the check and that call somebody could have put another file in
 // the place, which in a sticky folder the client might not delete. Every other daemon has its own rights only, and the
-// kernel asks for them, too.
+// kernel asks for them, too. A thread that may override modes at that moment all the same deletes nothing.
 //
 // What mode bits do not tell is in doubt, and what is in doubt stays: a folder with an access list, a path with "..".
 namespace telvane {

@@ -467,6 +467,7 @@ TEST_F(UploadOverTheWireTest, aFolderThatTakesTheFoldersPlaceDuringTheUploadKeep
 class HostileUploadTest : public UploadOverTheWireTest {
  protected:
   HostileUploadTest() {
+    _log.allowErrors();  // what such a client is told of its lost calls
     const Dictionary grant{{"executables", Array{Value(fs::canonical("/proc/self/exe").string())}},
                            {"entitlements", Dictionary{{kTelvanedEntitlement, true}}}};
     const auto plist = propertylist::serialize(Value(grant), propertylist::Format::XML).value();
@@ -475,9 +476,17 @@ class HostileUploadTest : public UploadOverTheWireTest {
   }
   ~HostileUploadTest() override { _connection.reset(); }
 
+  // What a client of its own make sends, which waits for nobody.
+  static ipc::Limits eager() {
+    ipc::Limits limits;
+    limits.maximumBatchCalls = 16;
+    limits.maximumBatchDescriptors = 16;
+    limits.maximumBatchesUnderWay = 1000;
+    return limits;
+  }
   // Opens a session.
-  void connect() {
-    _service = std::make_unique<ipc::SocketService>(_files, _dispatch, _log, _entitlements);
+  void connect(const ipc::Limits& limits = {}) {
+    _service = std::make_unique<ipc::SocketService>(_files, _dispatch, _log, _entitlements, nullptr, limits);
     auto made = _service->newConnection(kTelvanedServiceName);
     ASSERT_TRUE(made.has_value());
     _connection = *made;
@@ -488,6 +497,13 @@ class HostileUploadTest : public UploadOverTheWireTest {
   // Returns "yes" or "no" as the daemon says, or what happened to the call.
   std::string upload(const std::string& path, FileDescriptor descriptor) {
     return ask(ClientSessionOperation::UploadFileAtPath, {Value(path)}, std::move(descriptor));
+  }
+  // Does not wait for the answer.
+  void uploadInPassing(const std::string& path, const FileDescriptor& descriptor) {
+    ipc::Invocation made = invocation(ClientSessionOperation::UploadFileAtPath, {Value(path)});
+    made.descriptor = ipc::Descriptor(::fcntl(descriptor.get(), F_DUPFD_CLOEXEC, 0));
+    _connection->sendWithReply(
+        std::move(made), [](const Array&) {}, [](const Error&) {});
   }
   static FileDescriptor opened(const std::string& path, int flags = O_RDONLY | O_NONBLOCK) {
     FileDescriptor descriptor(::open(path.c_str(), flags | O_CLOEXEC, 0600));
@@ -589,6 +605,34 @@ TEST_F(HostileUploadTest, whateverDoesNotGrantTheFileIsRefusedLikeWhatIsNoRegula
   for (const std::string& one : {file, other, gone, pipe, std::string("/dev/zero"), std::string("/memfd:log")}) {
     EXPECT_TRUE(eventually([&] { return filesThatTheDaemonHasOpen(one).empty(); })) << one;
   }
+}
+
+// Each call that waits holds a descriptor of the daemon's, and everybody lives on these.
+TEST_F(HostileUploadTest, aCrowdOfUploadsBehindOneThatWaitsLeavesTheOthersTheirDescriptors) {
+  constexpr rlim_t kFewDescriptors = 512;
+  constexpr int kCrowd = 2000;
+  givenAServerThatWaits();
+  instance().givenConsent(true);
+  start();
+  const rlimit limit{kFewDescriptors, kFewDescriptors};
+  ASSERT_EQ(::prlimit(instance().daemon().pid(), RLIMIT_NOFILE, &limit, nullptr), 0);
+  connect(eager());
+  const std::string file = write("log", "text");
+  uploadInPassing(file, opened(file));
+  ASSERT_TRUE(hasCome(1)) << instance().daemonLog();
+  for (int i = 0; i < kCrowd; ++i) uploadInPassing(file, opened(file));
+  size_t most = 0;
+  givenPostsAnsweredBy([](const WireRequest&) { return WireServer::answer(200, "success"); });
+  ClientScript script;
+  script.open(sessionInfo(), userInfo("other")).configure().send(21, 1, Dictionary{{"n", 1}}).flush();
+  const auto other = WireFixture::start(script, "other");
+  while (other->isRunning()) most = std::max(most, filesThatTheDaemonHasOpen(file).size());
+  EXPECT_EQ(other->wait(), 0);
+  EXPECT_THAT(instance().read("other.out"), HasSubstr("flushed: ok")) << instance().daemonLog();
+  EXPECT_GT(most, 0u);
+  EXPECT_LT(most, kFewDescriptors / 2) << "held for one client";
+  EXPECT_TRUE(isLogged("hands over too many files at once"));
+  letTheServerAnswer();
 }
 
 // Files that the kernel makes up say that they are empty, and are not read: what they would tell may depend on who

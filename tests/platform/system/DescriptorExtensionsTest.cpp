@@ -3,9 +3,11 @@
 #include <fcntl.h>
 #include <grp.h>
 #include <gtest/gtest.h>
+#include <linux/securebits.h>
 #include <sched.h>
 #include <sys/mman.h>
 #include <sys/mount.h>
+#include <sys/prctl.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -391,6 +393,27 @@ TEST_F(FileRemovalForAClientTest, deletesALinkToSomebodyElsesFileAndNotTheFile) 
   EXPECT_FALSE(removes(theirs));
   EXPECT_TRUE(removes(_folder.at("own/log")));
   EXPECT_TRUE(fs::exists(theirs));
+}
+
+// Set up so, the kernel would not have the last word: it lets such a daemon delete what its client could not.
+TEST_F(FileRemovalForAClientTest, deletesNothingForADaemonThatKeepsItsPowersAsSomebodyElse) {
+  makeFolder("place", kClient, kClient, 0700);
+  const std::string path = makeFile("place/log", kClient);
+  ExtensionToken token = tokenFor(path);
+  token.holder = PeerIdentity{kClient, kClient, {}};
+  constexpr int kNoSuchSetting = 2;
+  const auto removesAs = [&](uid_t user) {
+    return as(0, [&] {
+      if (::prctl(PR_SET_SECUREBITS, SECBIT_NO_SETUID_FIXUP) != 0) return kNoSuchSetting;
+      if (::setresuid(user, user, user) != 0) return kNoSuchSetting;
+      return consume(path, token)->removeFile().has_value() ? 1 : 0;
+    });
+  };
+  EXPECT_EQ(removesAs(0), 0);
+  EXPECT_EQ(removesAs(kOther), 0);
+  EXPECT_EQ(removesAs(kClient), 0) << "in doubt, although it could";
+  ASSERT_TRUE(fs::exists(path));
+  EXPECT_TRUE(removes(path)) << "without that setting";
 }
 
 TEST_F(FileRemovalForAClientTest, leavesTheDaemonWithItsOwnRights) {
