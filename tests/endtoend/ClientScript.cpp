@@ -128,6 +128,10 @@ ClientScript& ClientScript::letGo() { return add("letGo"); }
 
 ClientScript& ClientScript::configure() { return add("configure"); }
 
+ClientScript& ClientScript::configure(std::chrono::seconds patience) {
+  return add("configure", {{kSeconds, static_cast<int64_t>(patience.count())}});
+}
+
 ClientScript& ClientScript::fetchStates(Value userInfo) {
   Dictionary arguments;
   arguments.set(kUserInfo, std::move(userInfo));

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <cstdint>
 #include <string>
 
@@ -22,8 +23,10 @@ class ClientScript {
   ClientScript& openAggregating(Dictionary sessionInfo, Value userInfo, const char* reaction = "");
   // Lets the session go.
   ClientScript& letGo();
-  // "configured: [names]", or "configured: nothing".
+  // "configured: [names]", "configured: nothing", or "configured: no answer" after some time or the given one: a
+  // session that is one too many is never told.
   ClientScript& configure();
+  ClientScript& configure(std::chrono::seconds patience);
   // "states: [names]", or "states: nothing".
   ClientScript& fetchStates(Value userInfo);
   ClientScript& send(uint16_t category, uint16_t type, Value payload = {}, uint32_t flag = 0);
@@ -57,6 +60,7 @@ class ClientScript {
   static constexpr char kKey[] = "key";
   static constexpr char kAlgorithm[] = "algorithm";
   static constexpr char kReaction[] = "reaction";
+  static constexpr char kSeconds[] = "seconds";
   static constexpr char kFrom[] = "from";
   static constexpr char kCount[] = "count";
   static constexpr char kFirst[] = "first";

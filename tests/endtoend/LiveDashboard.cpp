@@ -16,7 +16,7 @@ uint16_t LiveDashboard::Datagram::number(size_t offset) const {
 }
 
 LiveDashboard::LiveDashboard(Handler handler) : _handler(std::move(handler)) {
-  // Nobody knows the port before this constructor is through, so nothing comes before there is a server to answer.
+  MutexLock lock(_mutex);  // what comes waits in take() until there is a server to answer
   auto server =
       DatagramServer::start({{127, 0, 0, 1}, 0}, [this](const DatagramServer&, std::span<const uint8_t> bytes,
                                                         const IPv4SocketAddress& peer) { take(bytes, peer); });

@@ -111,11 +111,12 @@ class Runner {
   }
 
   // Runs what calls the given function with the answer, and says it, or that none came.
-  static void say(const std::string& what, const std::function<void(std::function<void(std::string)>)>& ask) {
+  static void say(const std::string& what, const std::function<void(std::function<void(std::string)>)>& ask,
+                  std::chrono::seconds patience = kPatience) {
     auto answered = std::make_shared<std::promise<std::string>>();
     std::future<std::string> answer = answered->get_future();
     ask([answered](std::string text) { answered->set_value(std::move(text)); });
-    const bool hasCome = answer.wait_for(kPatience) == std::future_status::ready;
+    const bool hasCome = answer.wait_for(patience) == std::future_status::ready;
     sayLine(what + ": " + (hasCome ? answer.get() : "no answer"));
   }
 
@@ -141,10 +142,14 @@ class Runner {
 
   void letGo(const Dictionary&) { _sessions.back()->letGo(); }
 
-  void configure(const Dictionary&) {
-    say("configured", [this](auto answer) {
-      session()->startConfigurationWithCompletionHandler([answer](const Value& names) { answer(namesOf(names)); });
-    });
+  void configure(const Dictionary& step) {
+    say(
+        "configured",
+        [this](auto answer) {
+          session()->startConfigurationWithCompletionHandler([answer](const Value& names) { answer(namesOf(names)); });
+        },
+        step.contains(ClientScript::kSeconds) ? std::chrono::seconds(step[ClientScript::kSeconds].integerValue())
+                                              : kPatience);
   }
 
   void fetchStates(const Dictionary& step) {

@@ -7,6 +7,7 @@
 #include <unistd.h>
 
 #include <fstream>
+#include <future>
 
 #include "platform/url/HTTPServer.h"
 #include "tests/endtoend/Instance.h"
@@ -57,17 +58,19 @@ class FaultyServerFixture : public ::testing::Test {
     HTTPServer::Options options;
     options.certificateFile = _instance.path("valid.pem");
     options.privateKeyFile = _instance.path("valid.key");
-    auto handler = [this, faultyPath, fault = std::move(fault)](const HTTPServer::Request& request,
-                                                                const std::shared_ptr<Responder>& responder) {
+    // The server's thread learns the address from here; the field is the test's.
+    std::promise<std::string> opened;
+    auto handler = [this, faultyPath, fault = std::move(fault), address = opened.get_future().share()](
+                       const HTTPServer::Request& request, const std::shared_ptr<Responder>& responder) {
       if (request.target.starts_with(faultyPath)) return fault(*responder);
-      const std::string postURL = request.target.starts_with("/conferencing")
-                                      ? "https://" + _server->address() + "/events"
-                                      : _instance.collectorURL("/events");
+      const std::string postURL = request.target.starts_with("/conferencing") ? "https://" + address.get() + "/events"
+                                                                              : _instance.collectorURL("/events");
       responder->send({200, {}, Data(_instance.signedEnvelope(openBag(postURL)))});
     };
     Result<std::unique_ptr<HTTPServer>> started = HTTPServer::start(std::move(options), std::move(handler));
     ASSERT_FALSE(started.has_error()) << started.error().description();
     _server = std::move(*started);
+    opened.set_value(_server->address());
     _instance.givenStorebagServer("https://" + _server->address());
     _instance.startDaemon();
   }

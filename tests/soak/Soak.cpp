@@ -46,8 +46,9 @@ constexpr bool kIsMemoryTelling = false;
 constexpr bool kIsMemoryTelling = true;
 #endif
 
+constexpr const char* kCutOff = "exceeds number of allowed active connections for clientType";
 constexpr const char* kExpectedErrors[] = {
-    "exceeds number of allowed active connections for clientType",
+    kCutOff,
     // One that was cut off goes on asking: its next call opens a session that has been told nothing.
     "missing clientType in its sessionInfo (null). Session terminated...",
     // None is there before the first one has come.
@@ -253,7 +254,10 @@ void Soak::checkLog() {
     const bool isExpected = std::any_of(std::begin(kExpectedErrors), std::end(kExpectedErrors),
                                         [&line](auto part) { return line.find(part) != std::string::npos; });
     if (!isExpected && line.find("<error>") != std::string::npos) fault("the daemon says " + line);
+    if (line.find(kCutOff) != std::string::npos) ++_cutOffs;
   }
+  constexpr size_t kEnoughToMeet = 300;
+  if (_cutOffs == 0 && _ledger.sessions() >= kEnoughToMeet) fault("no session was one too many of its client type");
   if (strangeLines > 0) fault(fmt::format("the daemon wrote {} lines that are no log:{}", strangeLines, strange));
 }
 
@@ -273,12 +277,12 @@ void Soak::printFigures() {
                    "rounds: {}; with the collector away: {} times\n"
                    "client processes: {} started, {} of them killed\n"
                    "sessions: {} opened and closed in {:.0f} s of rounds, {:.1f} per second; {} of them one-shot "
-                   "messages; {} moves between hierarchies\n"
+                   "messages; {} cut off; {} moves between hierarchies\n"
                    "events: {}{}\n"
                    "memory in KiB, before the first round and at rest after each:{}\n"
                    "descriptors, likewise:{}",
                    _rounds, _collector.absences(), _clients.started(), _clients.killed(), _ledger.sessions(), seconds,
-                   static_cast<double>(_ledger.sessions()) / seconds, _clients.oneShots(), _clients.moves(),
+                   static_cast<double>(_ledger.sessions()) / seconds, _clients.oneShots(), _cutOffs, _clients.moves(),
                    _ledger.events(), accounts, memory, descriptors)
             << std::endl;
 }

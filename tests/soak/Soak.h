@@ -71,6 +71,7 @@ class Soak {
   SoakClients _clients;
   std::vector<std::string> _faults;
   size_t _rounds = 0;
+  size_t _cutOffs = 0;  // sessions that were one too many, by the daemon's log
   SoakLedger::Session _firstOfRound = 0;
   size_t _absencesLeft = 0;  // in this round
   std::chrono::steady_clock::time_point _return;

@@ -19,8 +19,12 @@ using Lock = std::lock_guard<std::mutex>;
 constexpr char kLibraryClient[] = "telvane-scripted-client";
 constexpr char kWireClient[] = "telvane-soak-client";
 constexpr auto kPatience = std::chrono::seconds(240);
+// A session that is one too many is never told, and that is not to hold a round up. One that is told later is worth
+// nothing, and takes its family along, but such are few.
+constexpr auto kPatienceOfConfiguration = std::chrono::seconds(5);
 constexpr uint64_t kMostEventsAtOnce = 30;
 constexpr uint64_t kLevels = 4;
+constexpr uint64_t kCrowdedTypes = 2;
 
 constexpr std::string_view kFinished = "finished";
 constexpr std::string_view kExceeded = "Exceeded maximum active reporting session limit for userInfo='";
@@ -49,7 +53,9 @@ void SoakClients::startOne() {
 
 Dictionary SoakClients::newSessionInfo(SoakLedger::Session session) {
   constexpr int32_t kClientTypes = kLastClientType - kFirstClientType + 1;
-  return {{kTelvaneSessionInfoClientType, kFirstClientType + static_cast<int32_t>(below(kClientTypes))},
+  // All are used, and some by so many that not all are let in.
+  const uint64_t types = inPercent(30) ? kCrowdedTypes : kClientTypes;
+  return {{kTelvaneSessionInfoClientType, kFirstClientType + static_cast<int32_t>(below(types))},
           {kTelvaneSessionInfoSessionID, session},
           {kTelvaneSessionInfoBatchEvent, inPercent(70)},
           {kTelvaneSessionInfoRequireUserInfo, true}};
@@ -94,7 +100,7 @@ void SoakClients::addSession(ClientScript& script, Client& client, bool isLast) 
   } else {
     script.open(info, newUserInfo());
   }
-  script.configure();
+  script.configure(kPatienceOfConfiguration);
   for (uint64_t steps = 1 + below(4); steps > 0; --steps) {
     for (uint64_t events = 1 + below(kMostEventsAtOnce); events > 0; --events) {
       Event event = newEvent(session);
