@@ -71,6 +71,20 @@ TEST_F(TelvanedSessionSystemServicesTest, aMessageWithoutASessionIsHandedOverAsI
   EXPECT_EQ(handedOver(7, 2)[0][Key("k")], Value(1));
 }
 
+TEST_F(TelvanedSessionSystemServicesTest, whatAHierarchySharesIsNotHandedOver) {
+  givenConferencingSection(builtInSection());
+  Dictionary info = sessionInfoIn("call", 0);
+  info.set(kTelvaneSessionInfoClientType, 7);
+  const auto client = startSession(info);
+  client->tell(DaemonClient::Operation::UpdateSharedDataForKey, {"shared", "by somebody"});
+  client->send(42, 1, {{Key("own"), 1}});
+  client->sendMessage(Dictionary{{kTelvaneMessageParametersCategory, 42}, {kTelvaneMessageParametersType, 2}});
+  ASSERT_EQ(handedOver(42, 1).size(), 1u);
+  EXPECT_EQ(handedOver(42, 1)[0], (Dictionary{{Key("own"), 1}}));
+  ASSERT_EQ(handedOver(42, 2).size(), 1u);
+  EXPECT_EQ(handedOver(42, 2)[0], Dictionary()) << "the client sent nothing with it";
+}
+
 TEST_F(TelvanedSessionSystemServicesTest, aDeviceWithoutTheServiceLosesEventsAndGoesOn) {
   givenConferencingSection(builtInSection());
   process.wirelessDiagnostics().removeBundle(kBundle);
