@@ -1,6 +1,7 @@
 // Events on their way from a client process through a real daemon into a shared object of the device's.
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <signal.h>
 
 #include <filesystem>
 
@@ -85,6 +86,24 @@ TEST_F(WirelessDiagnosticsTest, anAdaptorThatThrowsCostsItsEventsOnly) {
            instance.daemonLogHas("TelvaneVDRAdaptorRelease of " + object() + " threw an exception");
   })) << instance.daemonLog();
   EXPECT_THAT(instance.sendEvents({"--count", "1"}), HasSubstr("flushed: ok")) << "the daemon lives on";
+}
+
+// It takes a thread of the daemon's with it, and whatever that thread held; nobody should have to guess who it was.
+TEST_F(WirelessDiagnosticsTest, anAdaptorThatEndsItsThreadEndsTheDaemonAndIsNamed) {
+  givenAdaptor("ThrowingAdaptor");
+  instance.grant("telvanectl");
+  startDaemon();
+  const auto client = instance.startProgram(
+      "telvanectl", {"send", "--client-type", "7", "--client-name", "sender", "--category", "2", "--type", "1"}, "ctl");
+  EXPECT_EQ(instance.daemon().wait(), -SIGABRT) << instance.daemonLog();
+  EXPECT_TRUE(instance.daemonLogHas("<error> TelvaneVDRAdaptorSendMessage of " + object() +
+                                    " ended the thread that called it\n"))
+      << instance.daemonLog();
+  // Another daemon, and another adaptor, and all is well again.
+  fs::remove(object());
+  givenAdaptor("RecordingAdaptor");
+  instance.startDaemon();
+  EXPECT_THAT(instance.sendEvents({"--client-type", "11", "--count", "1"}), HasSubstr("flushed: ok"));
 }
 
 TEST_F(WirelessDiagnosticsTest, aDeviceWithoutAnAdaptorLosesWhatWouldGoThere) {
