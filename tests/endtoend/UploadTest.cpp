@@ -593,7 +593,7 @@ TEST_F(HostileUploadTest, whateverDoesNotGrantTheFileIsRefusedLikeWhatIsNoRegula
   for (Attempt& one : attempts) {
     EXPECT_EQ(upload(one.path, std::move(one.descriptor)), "no") << one.what;
     ++refusals;
-    EXPECT_TRUE(eventually([&] { return linesInTheLog(instance().daemonLog(), kOnlyRegular) == refusals; }))
+    ASSERT_TRUE(eventually([&] { return linesInTheLog(instance().daemonLog(), kOnlyRegular) == refusals; }))
         << one.what;
   }
   EXPECT_EQ(uploads().size(), 0u);
