@@ -170,7 +170,11 @@ void TelvanedAgent::updateSharedDataForSession(TelvanedSession& session, const D
   const std::optional<String> token = session.hierarchyToken();
   if (!token.has_value()) return;
   MonitorLock lock(*_monitor);
-  _sharedData[token->str()].addEntriesFrom(sharedData);
+  const auto addition = _sharedData[token->str()].addEntriesFrom(sharedData);
+  if (addition == HierarchySharedData::Addition::Refused) {
+    log().error("updateSharedDataForSession: session {} would share more than {} bytes with its hierarchy. Not shared",
+                session.sessionID(), HierarchySharedData::kMaximumBytes);
+  }
 }
 
 void TelvanedAgent::removeObjectFromSharedDataForSession(TelvanedSession& session, const String& key) {
@@ -187,7 +191,7 @@ std::optional<Dictionary> TelvanedAgent::sharedDataForSession(TelvanedSession& s
   MonitorLock lock(*_monitor);
   const auto found = _sharedData.find(token->str());
   if (found == _sharedData.end()) return std::nullopt;
-  return found->second;
+  return found->second.entries();
 }
 
 void TelvanedAgent::copyReportingAgentState(std::vector<std::shared_ptr<TelvanedSession>>& sessionList,

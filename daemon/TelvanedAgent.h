@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "connectivity/ReportingSessionConnectivityHelper.h"
+#include "daemon/HierarchySharedData.h"
 #include "daemon/session/ClientSessionDispatcher.h"
 #include "daemon/session/TelvanedSession.h"
 #include "daemon/session/TelvanedSessionDelegate.h"
@@ -115,7 +116,7 @@ class TelvanedAgent : public TelvanedSessionDelegate,
   std::vector<std::shared_ptr<TelvanedSession>> _sessionList GUARDED_BY(*_monitor);
   Dictionary _cachedStorebags GUARDED_BY(*_monitor);  // storebag name -> record
   std::map<std::string, CorrelatedSessions> _correlatedSessions GUARDED_BY(*_monitor);
-  std::map<std::string, Dictionary> _sharedData GUARDED_BY(*_monitor);
+  std::map<std::string, HierarchySharedData> _sharedData GUARDED_BY(*_monitor);
   int32_t _xpcTransactionReference GUARDED_BY(*_monitor) = 0;
   std::array<uint8_t, kClientTypeCounters> _activeClients GUARDED_BY(*_monitor){};
 

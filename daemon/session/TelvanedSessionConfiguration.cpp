@@ -14,6 +14,7 @@ namespace {
 constexpr uint16_t kSessionMethod = 0;
 constexpr uint16_t kSessionStart = 0;
 constexpr std::string_view kUnknown = "Unknown";
+constexpr size_t kMaximumHierarchyTokenBytes = 1024;
 
 Value orUnknown(std::optional<String> answer) {
   return answer.has_value() ? Value(*std::move(answer)) : Value(String::fromStatic(kUnknown));
@@ -53,6 +54,12 @@ void TelvanedSession::setHierarchyFromSessionInfo() {
   const Dictionary* token =
       sessionInfo != nullptr ? (*sessionInfo)[kTelvaneSessionInfoHierarchyToken].dictionary() : nullptr;
   _hierarchyDictionary = token != nullptr ? std::optional(*token) : std::nullopt;
+  // The agent keeps the text longer than the session lives.
+  if (const auto text = hierarchyToken(); text.has_value() && text->size() > kMaximumHierarchyTokenBytes) {
+    log().error("setSessionInfo: the hierarchy token of session {} has more than {} bytes. It counts as standalone",
+                _sessionID, kMaximumHierarchyTokenBytes);
+    _hierarchyDictionary = std::nullopt;
+  }
 }
 
 bool TelvanedSession::hasValidUserInfoKeys() const {

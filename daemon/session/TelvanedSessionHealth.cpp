@@ -104,13 +104,11 @@ void TelvanedSession::sendOneMessageWithSessionInfo(const Dictionary& sessionInf
     return;
   }
   receivedUserInfo(userInfo);
+  const Date now = _context.platform().clock.now();
   for (const auto& [name, backend] : *_backends) {
     backend->updateState();
     backend->setReportingSessionConnectivityDelegate(_connectivityHelper);
-  }
-  activateHelperOfEnabledBackends();
-  const Date now = _context.platform().clock.now();
-  for (const auto& [name, backend] : *_backends) {
+    activateHelperOfEnabledBackends();
     if (isDropped(*backend, category, "sendOneMessageWithSessionInfo")) continue;
     sendOneMessageToBackend(*backend, now, category, type, payload);
   }

@@ -81,16 +81,6 @@ TEST_F(SessionsSideBySideTest, userInfoWithoutANameGivesUpNoHelperOfOthers) {
   EXPECT_EQ(postedEvents(7, 1).size(), 2u);
 }
 
-TEST_F(SessionsSideBySideTest, filedTwiceASessionIsUpdatedOnce) {
-  parent = openSession(sessionInfoIn("a", 0, 1));
-  child = openSession(sessionInfoIn("a", 1, 2));
-  agent().updateCorrelatedSessions(*sessions()[1]);
-  log().clear();
-  agent().updateDownstreamSessions(*sessions()[0]);
-  EXPECT_TRUE(hasLines(
-      log(), 1, "updateDownstreamSessions: Updating combined session ID and syncing reporting states for session 2"));
-}
-
 TEST_F(SessionsSideBySideTest, aSessionThatIsFiledAnewKeepsItsSharedDataWhateverOthersLeaveBehind) {
   parent = openSession(sessionInfoIn("a", 0, 1));
   parent->tell(ClientSessionOperation::UpdateSharedDataForKey, {"k", 1});

@@ -1,4 +1,5 @@
 // Sessions that belong together.
+#include "interfaces/AgentKeys.h"
 #include "tests/daemon/DaemonFixture.h"
 
 namespace telvane::testing {
@@ -67,10 +68,22 @@ TEST_F(TelvanedAgentHierarchyTest, aSessionWithoutAHierarchyHasNeither) {
   EXPECT_EQ(agent().parentSessionIDStringForSession(*sessions()[0]), std::nullopt);
 }
 
+TEST_F(TelvanedAgentHierarchyTest, aTokenOfMoreThanAKilobyteCountsAsNone) {
+  constexpr size_t kMost = 1024;
+  log().expectError(
+      "setSessionInfo: the hierarchy token of session 42 has more than 1024 bytes. It counts as standalone");
+  const auto longest = openSession(sessionInfoIn(std::string(kMost, 't').c_str(), 0));
+  const auto tooLong = openSession(sessionInfoIn(std::string(kMost + 1, 't').c_str(), 0));
+  EXPECT_EQ(sessions()[0]->hierarchyToken()->size(), kMost);
+  EXPECT_EQ(sessions()[1]->hierarchyToken(), std::nullopt);
+  EXPECT_EQ(agent().daemonStatus()[kStatusHierarchies], Value(1));
+}
+
 TEST_F(TelvanedAgentHierarchyTest, aChainNamesAllAncestorsFromTheTop) {
   givenLevels({0, 1, 2, 3});
   EXPECT_EQ(chainOf(2), idOf(1));
   EXPECT_EQ(chainOf(4), idOf(1) + "." + idOf(2) + "." + idOf(3));
+  EXPECT_TRUE(hasLine(log(), "parentSessionIDStringForSession: Checking hierarchyToken 'a' for session 4"));
 }
 
 TEST_F(TelvanedAgentHierarchyTest, withoutItsParentASessionHasNoChain) {
@@ -112,11 +125,12 @@ TEST_F(TelvanedAgentHierarchyTest, aHierarchyWithoutSessionsIsAnError) {
 }
 
 TEST_F(TelvanedAgentHierarchyTest, filingTwiceAddsOnce) {
-  givenLevels({0});
-  agent().updateCorrelatedSessions(*kept[0]);
-  close(1);
-  EXPECT_FALSE(openSession()->isInvalidated());
-  EXPECT_TRUE(hasLines(log(), 2, "as it has proper entitlement, 0(0) connections."));
+  givenLevels({0, 1});
+  agent().updateCorrelatedSessions(*kept[1]);
+  log().clear();
+  agent().updateDownstreamSessions(*kept[0]);
+  EXPECT_TRUE(hasLines(
+      log(), 1, "updateDownstreamSessions: Updating combined session ID and syncing reporting states for session 2"));
 }
 
 TEST_F(TelvanedAgentHierarchyTest, aSessionThatIsFiledAgainStandsBehindItsSiblings) {

@@ -113,6 +113,52 @@ TEST_F(TelvanedAgentLimitsTest, removingAKeyThatNobodySharesMakesNothing) {
   EXPECT_EQ(agent().sharedDataForSession(*sessions()[0]), std::nullopt);
 }
 
+// All of it stands in every event.
+TEST_F(TelvanedAgentLimitsTest, whatAHierarchySharesIsBounded) {
+  const char* line = "updateSharedDataForSession: session 42 would share more than 1048576 bytes with its hierarchy";
+  log().expectError(line);
+  const std::string most(900 << 10, 'x');
+  const auto client = openSession(sessionInfoIn("a", 0));
+  const auto keys = [this] {
+    std::string text;
+    for (const DictionaryEntry& entry : *agent().sharedDataForSession(*sessions()[0])) text += entry.key.view();
+    return text;
+  };
+  client->tell(kShare, {"a", Value(most)});
+  client->tell(kShare, {"b", Value(most)});
+  client->tell(ClientSessionOperation::UpdateSharedDataWithDictionary,
+               {Dictionary{{Key("c"), 1}, {Key("d"), Array{Value(Dictionary{{Key("e"), Value(most)}})}}}});
+  EXPECT_EQ(keys(), "a") << "all of an update, or nothing";
+  EXPECT_TRUE(hasLines(log(), 1, line)) << "one line per burst";
+  client->tell(kShare, {"a", Value(most.substr(1))});
+  client->tell(kShare, {"a", 1});
+  client->tell(kShare, {"b", Value(Data::copyOf(most))});
+  EXPECT_EQ(keys(), "ab") << "what is replaced gives way";
+  client->tell(kShare, {"c", Value(most)});
+  EXPECT_TRUE(hasLines(log(), 2, line));
+  client->tell(kShare, {"b", Value()});
+  client->tell(kShare, {"c", Value(most)});
+  EXPECT_EQ(keys(), "ac") << "and so does what is removed";
+  const auto other = openSession(sessionInfoIn("b", 0));
+  other->tell(kShare, {"own", Value(most)});
+  EXPECT_TRUE(agent().sharedDataForSession(*sessions()[1])->contains("own")) << "each hierarchy has room of its own";
+}
+
+// Small entries count too, and so do their keys.
+TEST_F(TelvanedAgentLimitsTest, noNumberOfSmallEntriesIsSharedWithoutABound) {
+  log().expectError("would share more than 1048576 bytes with its hierarchy");
+  const auto client = openSession(sessionInfoIn("a", 0));
+  constexpr int kUpdates = 300;
+  for (int update = 0; update < kUpdates; ++update) {
+    Dictionary entries;
+    for (int n = 0; n < 100; ++n) entries.set(String(fmt::format("a key of its own {} {}", update, n)), n);
+    client->tell(ClientSessionOperation::UpdateSharedDataWithDictionary, {entries});
+  }
+  const size_t shared = agent().sharedDataForSession(*sessions()[0])->size();
+  EXPECT_GT(shared, 10000u);
+  EXPECT_LT(shared, 30000u);
+}
+
 TEST_F(TelvanedAgentLimitsTest, aSessionWithoutAHierarchySharesNothing) {
   givenStorebag();
   const auto client = startSession();

@@ -48,6 +48,16 @@ TEST_F(TelvanedSessionOneShotTest, onInternalBuildsCarriesTheSerialNumber) {
   EXPECT_THAT(postedEvents(7, 2)[0], HasEntry("SerialNum", "SIM0001"));
 }
 
+TEST_F(TelvanedSessionOneShotTest, onInternalBuildsWithoutASerialNumberSaysSo) {
+  givenInternalBuild();
+  process.deviceAnswers().remove(DeviceAnswers::kSerialNumber.view());
+  givenStorebag(StorebagBuilder().set(kEnvironmentInternal, StorebagBuilder::section("splunk")));
+  EXPECT_EQ(statusOf(sendOne(sessionInfo(), userInfo())), "finished");
+  client->close();
+  ASSERT_EQ(postedEvents(7, 2).size(), 1u) << log().text();
+  EXPECT_THAT(postedEvents(7, 2)[0], HasEntry("SerialNum", "Unknown"));
+}
+
 TEST_F(TelvanedSessionOneShotTest, withoutAUserInfoFinishesAndSendsNothing) {
   givenStorebag();
   log().expectError("sendOneMessageWithSessionInfo: userInfo must be present and valid!!! Aborting method...");
