@@ -14,7 +14,7 @@ format-check: ## say which files are not formatted
 	@sh scripts/format --check
 lint: ## check the house's arrows and run clang-tidy
 	@sh scripts/lint
-sanitize: ## unit tests under the address, undefined and thread sanitizers
+sanitize: ## the tests under the address, undefined and thread sanitizers
 	@sh scripts/sanitize
 bench: ## measure: single stations, then the whole road beside the ceiling
 	@sh scripts/bench
