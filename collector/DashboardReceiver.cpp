@@ -1,7 +1,5 @@
 #include "collector/DashboardReceiver.h"
 
-#include "collector/DashboardEvent.h"
-
 namespace telvane {
 namespace {
 
@@ -15,6 +13,14 @@ std::string identityOf(std::span<const uint8_t> datagram, const IPv4SocketAddres
   const auto header = datagram.first(kHeaderLength);
   identity.append(header.begin(), header.end());
   return identity;
+}
+
+// The finalizer of splitmix64 (Steele, Lea and Flood, "Fast splittable pseudorandom number generators", 2014).
+uint64_t mixed(uint64_t value) {
+  value += 0x9E3779B97F4A7C15;
+  value = (value ^ (value >> 30)) * 0xBF58476D1CE4E5B9;
+  value = (value ^ (value >> 27)) * 0x94D049BB133111EB;
+  return value ^ (value >> 31);
 }
 
 }  // namespace
@@ -32,7 +38,7 @@ Result<std::unique_ptr<DashboardReceiver>> DashboardReceiver::start(Options opti
 }
 
 DashboardReceiver::DashboardReceiver(Options options, EventStore& events)
-    : _options(std::move(options)), _events(events), _chance(_options.lossSeed) {}
+    : _options(std::move(options)), _events(events) {}
 
 Dictionary DashboardReceiver::statistics() const {
   Dictionary counts;
@@ -45,52 +51,62 @@ Dictionary DashboardReceiver::statistics() const {
 
 void DashboardReceiver::take(const DatagramServer& server, std::span<const uint8_t> datagram,
                              const IPv4SocketAddress& peer) {
-  if (getsLost()) return;
   const Result<DashboardEvent> event = DashboardEvent::decode(datagram);
   if (event.has_error()) {
     ++_refused;
     return;
   }
-  std::string identity = identityOf(datagram, peer);
-  if (isKnown(identity)) {
+  Known& known = remember(identityOf(datagram, peer));
+  known.eventID = event->eventID;
+  ++known.times;
+  if (getsLost(known, Way::Here)) return;
+  if (known.isStored) {
     ++_repeated;
-    if (event->isReliable) acknowledge(server, datagram, peer);
-    return;
+  } else {
+    known.isStored = store(*event, peer);
   }
+  if (known.isStored && event->isReliable) acknowledge(server, known, datagram, peer);
+}
+
+bool DashboardReceiver::store(const DashboardEvent& event, const IPv4SocketAddress& peer) {
   Dictionary line;
   line.set("dashboard", Value(true));
   line.set("peer", Value(description(peer)));
-  line.set("reliable", Value(event->isReliable));
-  line.set("addressedByBag", Value(event->isAddressedByBag));
-  line.set("event", event->dictionary());
+  line.set("reliable", Value(event.isReliable));
+  line.set("addressedByBag", Value(event.isAddressedByBag));
+  line.set("event", event.dictionary());
   if (_events.add(line).has_error()) {
     ++_refused;
-    return;
+    return false;
   }
   ++_stored;
-  remember(std::move(identity));
-  if (_options.show) _options.show(event->line());
-  if (event->isReliable) acknowledge(server, datagram, peer);
+  if (_options.show) _options.show(event.line());
+  return true;
 }
 
-void DashboardReceiver::acknowledge(const DatagramServer& server, std::span<const uint8_t> datagram,
+void DashboardReceiver::acknowledge(const DatagramServer& server, const Known& known, std::span<const uint8_t> datagram,
                                     const IPv4SocketAddress& peer) {
   // One that finds no room is as good as lost: the event comes again.
-  if (!getsLost()) server.send(peer, datagram.first(kAcknowledgementLength));
+  if (!getsLost(known, Way::Back)) server.send(peer, datagram.first(kAcknowledgementLength));
 }
 
-bool DashboardReceiver::getsLost() {
-  if (_options.lossPercent == 0 || _chance() % kHundred >= _options.lossPercent) return false;
+bool DashboardReceiver::getsLost(const Known& known, Way way) {
+  if (_options.lossPercent == 0) return false;
+  const uint64_t one = uint64_t{known.eventID} << 33 | uint64_t{known.times} << 1 | (way == Way::Back ? 1 : 0);
+  if (mixed(mixed(_options.lossSeed) ^ one) % kHundred >= _options.lossPercent) return false;
   ++_lost;
   return true;
 }
 
-void DashboardReceiver::remember(std::string identity) {
-  _knownInOrder.push_back(identity);
-  _known.insert(std::move(identity));
-  if (_knownInOrder.size() <= kRemembered) return;
-  _known.erase(_knownInOrder.front());
-  _knownInOrder.pop_front();
+DashboardReceiver::Known& DashboardReceiver::remember(std::string identity) {
+  const auto [known, isNew] = _known.try_emplace(std::move(identity));
+  if (!isNew) return known->second;
+  _knownInOrder.push_back(known->first);
+  if (_knownInOrder.size() > kRemembered) {
+    _known.erase(_knownInOrder.front());
+    _knownInOrder.pop_front();
+  }
+  return known->second;
 }
 
 }  // namespace telvane

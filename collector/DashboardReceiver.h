@@ -5,10 +5,10 @@
 #include <deque>
 #include <functional>
 #include <memory>
-#include <random>
 #include <string>
-#include <unordered_set>
+#include <unordered_map>
 
+#include "collector/DashboardEvent.h"
 #include "collector/EventStore.h"
 #include "platform/datagram/DatagramServer.h"
 
@@ -25,8 +25,9 @@ class DashboardReceiver {
   using Listener = std::function<void(const std::string& line)>;
   struct Options {
     IPv4SocketAddress address;  // port 0 picks one
-    // How many of a hundred datagrams are dropped as if they had got lost, and as many acknowledgements, by chance from
-    // the seed. For showing and trying what reliable mode is for.
+    // How many of a hundred events are dropped as if they had got lost, each time they come, and as many
+    // acknowledgements. The seed decides of each by its event ID and by how often it came: what gets lost depends
+    // neither on the order nor on the speed in which they come. For showing and trying what reliable mode is for.
     unsigned lossPercent = 0;
     uint64_t lossSeed = 0;
     // Gets a line for people per event, on the receiver's thread; empty: nothing is shown.
@@ -45,20 +46,29 @@ class DashboardReceiver {
   static constexpr size_t kRemembered = 4096;
 
   DashboardReceiver(Options options, EventStore& events);
+  // An event that has come lately, whether it got lost or not.
+  struct Known {
+    uint16_t eventID = 0;
+    uint32_t times = 0;
+    bool isStored = false;
+  };
+  enum class Way { Here, Back };
+
   void take(const DatagramServer& server, std::span<const uint8_t> datagram, const IPv4SocketAddress& peer);
-  void acknowledge(const DatagramServer& server, std::span<const uint8_t> datagram, const IPv4SocketAddress& peer);
-  bool getsLost();
-  // Whether these bytes of the peer have been stored lately.
-  bool isKnown(const std::string& identity) const { return _known.count(identity) != 0; }
-  void remember(std::string identity);
+  // Returns whether it is stored.
+  bool store(const DashboardEvent& event, const IPv4SocketAddress& peer);
+  void acknowledge(const DatagramServer& server, const Known& known, std::span<const uint8_t> datagram,
+                   const IPv4SocketAddress& peer);
+  bool getsLost(const Known& known, Way way);
+  // Valid until the next call.
+  Known& remember(std::string identity);
 
   // Constant after construction.
   const Options _options;
   EventStore& _events;
 
   // Confined to the server's thread.
-  std::mt19937_64 _chance;
-  std::unordered_set<std::string> _known;
+  std::unordered_map<std::string, Known> _known;
   std::deque<std::string> _knownInOrder;
 
   // Synchronised by themselves.

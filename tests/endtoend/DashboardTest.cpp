@@ -340,11 +340,10 @@ TEST_F(DashboardTest, isAloneInAcknowledging) {
 // The collector as the dashboard, over a network that loses datagrams and acknowledgements.
 class DashboardCollectorTest : public ::testing::Test {
  protected:
-  // Every twentieth. Whatever the order in which datagrams come, among the first 22 one gets lost and the
-  // acknowledgement of another; and among the 110 that may come at most, five times each, fewer than five do in all. So
-  // no event is lost however slow the machine is, and both kinds of loss are seen.
-  static constexpr char kLossPercent[] = "5";
-  static constexpr char kSeed[] = "117";
+  // The seed decides of each event by its number and by how often it came. With this one, of the events here three get
+  // lost at first and the acknowledgements of two others, and none more than twice; so no event is lost for good.
+  static constexpr char kLossPercent[] = "20";
+  static constexpr char kSeed[] = "3";
   static constexpr int kSent = 20;
   static constexpr int64_t kAll = kSent + 2;  // with the session's start and stop
 
