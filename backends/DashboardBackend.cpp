@@ -4,9 +4,9 @@
 #include <array>
 #include <new>
 
+#include "backends/ClientMessage.h"
 #include "backends/DashboardDatagram.h"
 #include "interfaces/ClientTypes.h"
-#include "interfaces/SessionKeys.h"
 #include "interfaces/StorebagKeys.h"
 #include "platform/Transactions.h"
 
@@ -199,8 +199,7 @@ bool DashboardBackend::startTimer() {
 
 std::optional<String> DashboardBackend::sendMessage(Dictionary blob, Date timestamp, uint16_t method, uint16_t respCode,
                                                     uint16_t eventID, uint32_t /*flag*/) {
-  const Dictionary* clientData = blob[kTelvaneMessageBlobClientData].dictionary();
-  return sendMessage(clientData != nullptr ? *clientData : blob, timestamp, method, respCode, eventID);
+  return sendMessage(sentByClient(std::move(blob)), timestamp, method, respCode, eventID);
 }
 
 std::optional<String> DashboardBackend::sendMessage(const Dictionary& event, Date timestamp, uint16_t method,

@@ -21,7 +21,9 @@ namespace telvane {
 //
 // Made by initWithName through the factory; threads as in the base. An event becomes its datagram on the caller's
 // thread; the socket and what waits to be sent belong to the network queue. uploadLogData blocks its caller until the
-// post is through.
+// server has answered, or until it is clear that it cannot; the answer comes on the connectivity helper's queue, so the
+// caller must be another one. Log data are uploads like files: they take one of the process's places for as long
+// (RunningUploads), are refused when there is none, and wait no more when the process is to end.
 //
 // In reliable mode the server acknowledges each datagram by its event ID, and one that it does not acknowledge is sent
 // again 2, 3, 5 and 9 periods after the time before, then given up. What could not be sent at all is tried each period.
@@ -42,7 +44,8 @@ class DashboardBackend final : public TelvaneBackend {
   static constexpr std::chrono::milliseconds kLongestPeriod{60000};
   static constexpr std::chrono::milliseconds kLastResort{9500};
   static constexpr size_t kMostPackets = 50;
-  static constexpr size_t kLongestLogLine = 1151;  // bytes
+  static constexpr size_t kLongestLogLine = 1151;   // bytes
+  static constexpr size_t kLongestLocation = 4096;  // bytes
 
   // Takes the address from the profile. Each form returns null, with an error line, when there is no address, or no
   // socket can be had or connected to it.
@@ -62,7 +65,8 @@ class DashboardBackend final : public TelvaneBackend {
   ~DashboardBackend() override;
 
   using TelvaneBackend::sendMessage;
-  // Sends the event's fields: the blob's client data, or all of the blob when it has none. The flag means nothing here.
+  // Sends the event's fields, which are what the client sent; what its hierarchy shares may be other clients' and stays
+  // here. The flag means nothing.
   std::optional<String> sendMessage(Dictionary blob, Date timestamp, uint16_t method, uint16_t respCode,
                                     uint16_t eventID, uint32_t flag) override;
   // Makes a datagram of the event's fields, hands it to the network queue and returns the event as one line for people
@@ -70,8 +74,8 @@ class DashboardBackend final : public TelvaneBackend {
   std::optional<String> sendMessage(const Dictionary& event, Date timestamp, uint16_t method, uint16_t respCode,
                                     uint16_t eventID);
   // Posts the array as an archive (platform/KeyedArchive.h) to the profile's "post_url" and waits for the answer, whose
-  // body is the data's location, which is then sent as an event. Returns whether that went well; true without a
-  // connectivity helper, where nothing is posted.
+  // body is the data's location, of at most kLongestLocation, which is then sent as an event. Returns whether that went
+  // well; true without a connectivity helper, where nothing is posted.
   bool uploadLogData(const Array& logData) override;
   void cleanup() override;
 
@@ -115,12 +119,6 @@ class DashboardBackend final : public TelvaneBackend {
   void scheduleLastResort() REQUIRES(*_networkProcQueue);
   void cleanupSources() REQUIRES(*_networkProcQueue);
 
-  // What became of the log data's post.
-  struct PostAnswer {
-    Data data;
-    std::optional<Error> error;
-  };
-  PostAnswer postAndWait(ReportingSessionConnectivityInterface& helper, URLRequest request);
   void logDataUploaded(const Data& answer);
 
   // Constant after construction.

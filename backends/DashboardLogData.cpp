@@ -1,5 +1,7 @@
 // The log data that a dashboard backend uploads.
 #include "backends/DashboardBackend.h"
+#include "backends/LoggableAnswer.h"
+#include "backends/WaitedPost.h"
 #include "interfaces/EventKeys.h"
 #include "platform/Clock.h"
 #include "platform/KeyedArchive.h"
@@ -11,6 +13,15 @@ namespace {
 constexpr uint16_t kLogDataMethod = 0;
 constexpr uint16_t kLogDataUploaded = 2;
 constexpr uint32_t kOrdinary = 0;
+
+// Why there is no location in the answer; nothing when there is one. A server that says more than a location takes is
+// showing a page to somebody, and no part of that leads to the data.
+std::optional<std::string> failureIn(const WaitedPost::Answer& answer) {
+  if (answer.error.has_value()) return answer.error->description();
+  if (!answer.data.has_value() || answer.data->empty()) return "(null)";
+  if (answer.data->size() <= DashboardBackend::kLongestLocation) return std::nullopt;
+  return fmt::format("an answer of {} bytes is no location", answer.data->size());
+}
 
 }  // namespace
 
@@ -31,35 +42,25 @@ bool DashboardBackend::uploadLogData(const Array& logData) {
   request.body = *std::move(archive);
   const auto helper = _reportingSessionConnectivityDelegate.lock();
   if (helper == nullptr) return true;
-  const PostAnswer answer = postAndWait(*helper, std::move(request));
-  if (answer.error.has_value() || answer.data.empty()) {
-    log().error("DashboardBackend(uploadLogData): Error uploading log data array ({})",
-                answer.error.has_value() ? answer.error->description() : "(null)");
+  WaitedPost post(_context.platform().dispatch);
+  const auto place =
+      _context.runningUploads().begin(RunningUploads::Kind::LogData, post.semaphore(), request.body.size());
+  if (!place.has_value()) {
+    log().error("DashboardBackend(uploadLogData): Too much is being uploaded already, or the daemon is about to end");
     return false;
   }
-  logDataUploaded(answer.data);
+  const WaitedPost::Answer answer = post.postAndWait(*helper, std::move(request));
+  if (const std::optional<std::string> failure = failureIn(answer); failure.has_value()) {
+    log().error("DashboardBackend(uploadLogData): Error uploading log data array ({})", *failure);
+    return false;
+  }
+  logDataUploaded(*answer.data);
   return true;
-}
-
-DashboardBackend::PostAnswer DashboardBackend::postAndWait(ReportingSessionConnectivityInterface& helper,
-                                                           URLRequest request) {
-  const auto answer = std::make_shared<PostAnswer>();
-  const std::shared_ptr<Semaphore> answered = _context.platform().dispatch.newSemaphore(0);
-  // Signals when it goes: with the answer, or with a completion that is dropped because the helper is through.
-  std::shared_ptr<void> signal(nullptr, [answered](void*) { answered->signal(); });
-  helper.postURLRequestWithCompletionHandler(
-      std::move(request), [answer, signal = std::move(signal)](const Data& data, const URLResponse*,
-                                                               const std::optional<Error>& error) mutable {
-        *answer = {data, error};
-        signal.reset();
-      });
-  answered->wait();
-  return std::move(*answer);
 }
 
 void DashboardBackend::logDataUploaded(const Data& answer) {
   const std::string location = utf8::repaired(answer.view());
-  log().message("DashboardBackend(uploadLogData): Log data uploaded to {}", location);
+  log().message("DashboardBackend(uploadLogData): Log data uploaded to {}", loggableAnswer(location));
   TelvaneBackend::sendMessage(Dictionary{{kEventLogDataUploadLocation, location}}, _context.platform().clock.now(),
                               kLogDataMethod, kLogDataUploaded, kOrdinary);
 }

@@ -18,8 +18,8 @@ namespace telvane {
 // must be another one. The file is read and compressed into a temporary file first, in pieces; no part of it waits in
 // memory.
 //
-// At most RunningUploads::kMostAtOnce uploads run in the process at once; one more is refused. When the process is to
-// end, those that wait for their server wait no more, and their files stay.
+// At most RunningUploads::kMostAtOnce uploads run in the process at once, log data among them; one more is refused.
+// When the process is to end, those that wait for their server wait no more, and their files stay.
 //
 // A client's file is deleted when the server's answer contains "success", wherever in it, and stays in every other
 // case. docs/upload-protocol.md has the request in bytes.
@@ -42,9 +42,6 @@ class UploadBackend final : public TelvaneBackend {
   std::optional<URLRequest> newRequest(const String& path, const SandboxExtension& extension, uint64_t size,
                                        const RunningUploads::Place& place) const;
   std::string requestURL(const String& path) const;
-  struct ServerAnswer;
-  void postAndWait(ReportingSessionConnectivityInterface& helper, URLRequest request,
-                   const std::shared_ptr<ServerAnswer>& answer) const;
   void answered(const Data& data, SandboxExtension& extension, const String& path) const;
 
   const String _uploadURL;

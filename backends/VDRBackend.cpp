@@ -3,8 +3,8 @@
 #include <string_view>
 #include <utility>
 
+#include "backends/ClientMessage.h"
 #include "interfaces/ClientTypes.h"
-#include "interfaces/SessionKeys.h"
 
 namespace telvane {
 namespace {
@@ -14,18 +14,6 @@ constexpr char kClientBundlePath[] =
 constexpr std::string_view kAdaptorClass = "VDRAdaptor";
 constexpr std::string_view kForwardingSelector = "sendMessageWithMethod:respCode:dict:";
 constexpr uint32_t kNoClientType = 0;
-
-// What the client sent with this message. A session wraps it and lays beside it what the hierarchy shares, which other
-// clients may have put there; a message without a payload is then one of shared data alone, and the client sent
-// nothing. A one-shot message is not wrapped.
-Dictionary sentByClient(Dictionary blob) {
-  const bool hasClientData = blob[kTelvaneMessageBlobClientData].isDictionary();
-  const bool hasSharedData = blob[kTelvaneMessageBlobSharedData].isDictionary();
-  const bool isWrapped = blob.size() > 0 && blob.size() == (hasClientData ? 1u : 0u) + (hasSharedData ? 1u : 0u);
-  if (!isWrapped) return blob;
-  if (!hasClientData) return {};
-  return *blob[kTelvaneMessageBlobClientData].dictionary();
-}
 
 }  // namespace
 

@@ -227,6 +227,18 @@ TEST_F(DashboardDatagramTest, hasTheClientsDataOfAMessageAndNotWhatSessionsShare
   EXPECT_EQ(lastTextAt(dashboard()), " own=3") << "a message without a configured session";
 }
 
+TEST_F(DashboardDatagramTest, hasNoTextWhereTheClientSentNoPayloadWhateverItsSessionsShare) {
+  make();
+  TelvaneBackend& base = backend();
+  const auto line =
+      base.sendMessage(Dictionary{{kTelvaneMessageBlobSharedData, Dictionary{{Key("shared"), 1}}}}, kTime, 7, 2, 0);
+  _world.runUntilIdle();
+  ASSERT_EQ(dashboard().arrivals().size(), 1u);
+  EXPECT_EQ(lastTextAt(dashboard()), "");
+  ASSERT_TRUE(line.has_value());
+  EXPECT_EQ(line->view().find("SharedData"), std::string_view::npos) << line->view();
+}
+
 TEST_F(DashboardDatagramTest, numbersEventsFromOne) {
   make();
   sendMany(3);

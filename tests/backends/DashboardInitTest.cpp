@@ -6,6 +6,7 @@
 #include <system_error>
 
 #include "tests/backends/DashboardFixture.h"
+#include "tests/support/NotedTimers.h"
 #include "tests/support/PlatformWith.h"
 
 namespace telvane::testing {
@@ -229,6 +230,20 @@ class TimerlessDispatch final : public Dispatch {
   const bool _throws;
   int _timers;
 };
+
+// So that a device with many such timers wakes up for several of them at once.
+TEST_F(DashboardInitTest, letsEachTickComeUpTo100MillisecondsLate) {
+  NotedTimers noted(_process.platform().dispatch);
+  Platform platform = platformWith(_process.platform(), noted);
+  const ProcessContext context(platform);
+  givenReliable();
+  take(DashboardBackend::initWithName(context, "dashboard", _profile, String("Box")));
+  tick(2);
+  EXPECT_THAT(noted.leeways(), ::testing::ElementsAre(std::chrono::milliseconds(100), std::chrono::milliseconds(100),
+                                                      std::chrono::milliseconds(100)));
+  letGo();
+  _world.runUntilIdle();
+}
 
 class DashboardWithoutATimerTest : public DashboardInitTest, public ::testing::WithParamInterface<bool> {};
 

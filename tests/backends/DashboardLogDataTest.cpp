@@ -156,23 +156,124 @@ TEST_F(DashboardLogDataTest, mendsALocationThatIsNoText) {
             "b\\=");
 }
 
-TEST_F(DashboardLogDataTest, waitsForTheAnswerWithoutALimit) {
-  make();  // with the helper that answers when the test does
-  bool isUploaded = false;
-  bool isThrough = false;
-  const auto queue = _process.platform().dispatch.newSerialQueue("session");
-  queue->async([this, &isUploaded, &isThrough] {
-    isUploaded = backend().uploadLogData(Array{1});
-    isThrough = true;
-  });
-  _world.advance(std::chrono::hours(1));
+// What is longer is a page for people. It is not shown in the log either, where the device's owner would pay for it.
+TEST_F(DashboardLogDataTest, takesAnAnswerForALocationThatIsNotLongerThanOne) {
+  _helper->answer = Data(std::string(DashboardBackend::kLongestLocation, 'x'));
+  EXPECT_TRUE(upload({}));
+  EXPECT_TRUE(lastTextAt(dashboard()).starts_with(" LogDataUploadLocation=xxx"));
+  const size_t events = dashboard().arrivals().size();
+  _helper->answer = Data(std::string(DashboardBackend::kLongestLocation + 1, 'y'));
+  log().expectError(
+      "DashboardBackend(uploadLogData): Error uploading log data array (an answer of 4097 bytes is no location)");
+  EXPECT_FALSE(upload({}));
+  EXPECT_EQ(dashboard().arrivals().size(), events);
+  EXPECT_TRUE(hasNoLine(log(), "yyy"));
+}
+
+TEST_F(DashboardLogDataTest, showsNoControlsOfAnAnswerInTheLog) {
+  _helper->answer = Data::copyOf("https://x/\x1b[2J\x7f");
+  EXPECT_TRUE(upload({}));
+  EXPECT_TRUE(hasLine(log(), "DashboardBackend(uploadLogData): Log data uploaded to https://x/ [2J "));
+  EXPECT_TRUE(hasNoLine(log(), "\x1b"));
+}
+
+// A helper that answers when the test does, and a session's queue that waits for it.
+class WaitingLogDataTest : public DashboardLogDataTest {
+ protected:
+  WaitingLogDataTest() {
+    _profile.set(kProfileReliable, 60'000);  // a tick a minute, so that days pass quickly
+    make();
+  }
+  void startUpload(const Array& logData = Array{1}) {
+    _queue->async([this, logData] { _outcome = backend().uploadLogData(logData); });
+    _world.runUntilIdle();
+  }
+  RunningUploads& uploads() { return context().runningUploads(); }
+  std::optional<RunningUploads::Place> place(uint64_t bytes) {
+    return uploads().begin(RunningUploads::Kind::LogData, _process.platform().dispatch.newSemaphore(0), bytes);
+  }
+  // Takes all places but one.
+  std::vector<RunningUploads::Place> allPlacesButOne() {
+    std::vector<RunningUploads::Place> places;
+    while (places.size() + 1 < RunningUploads::kMostAtOnce) places.push_back(*place(0));
+    return places;
+  }
+
+  static constexpr char kNoRoom[] =
+      "DashboardBackend(uploadLogData): Too much is being uploaded already, or the daemon is about to end";
+  const std::shared_ptr<SerialQueue> _queue = _process.platform().dispatch.newSerialQueue("session");
+  std::optional<bool> _outcome;  // nothing while it waits
+};
+
+TEST_F(WaitingLogDataTest, waitsForTheAnswerWithoutALimit) {
+  startUpload();
+  _world.advance(std::chrono::hours(24 * 8));
   EXPECT_EQ(_connectivity->count(), 1u);
-  EXPECT_FALSE(isThrough);
+  EXPECT_EQ(_outcome, std::nullopt);
   _connectivity->fail(0, Error::withDescription("Test", 5, "late"));
   log().expectError("Error uploading log data array (late)");
   _world.runUntilIdle();
-  EXPECT_TRUE(isThrough);
-  EXPECT_FALSE(isUploaded);
+  EXPECT_EQ(_outcome, false);
+}
+
+TEST_F(WaitingLogDataTest, waitsNoMoreWhenTheProcessIsToEnd) {
+  startUpload();
+  log().expectError("DashboardBackend(uploadLogData): Error uploading log data array ((null))");
+  uploads().cancelAll();
+  _world.runUntilIdle();
+  EXPECT_EQ(_outcome, false);
+  log().expectError(kNoRoom);
+  _outcome.reset();
+  startUpload();
+  EXPECT_EQ(_outcome, false);
+  EXPECT_EQ(_connectivity->count(), 1u) << "nothing more is posted";
+  _connectivity->answer(0, 200);
+  _world.runUntilIdle();
+  EXPECT_TRUE(dashboard().arrivals().empty()) << "too late to be told";
+}
+
+TEST_F(WaitingLogDataTest, takesOneOfTheProcesssPlacesForAsLongAsItWaits) {
+  const auto others = allPlacesButOne();
+  startUpload();
+  EXPECT_FALSE(place(0).has_value());
+  log().expectError("Error uploading log data array ((null))");
+  _connectivity->answer(0, 200);
+  _world.runUntilIdle();
+  EXPECT_EQ(_outcome, false);
+  EXPECT_TRUE(place(0).has_value());
+}
+
+TEST_F(WaitingLogDataTest, isRefusedWithoutAPlace) {
+  const auto others = allPlacesButOne();
+  const auto last = place(0);
+  log().expectError(kNoRoom);
+  startUpload();
+  EXPECT_EQ(_outcome, false);
+  EXPECT_TRUE(hasLines(log(), 1, kNoRoom));
+  EXPECT_EQ(_connectivity->count(), 0u);
+}
+
+TEST_F(WaitingLogDataTest, isRefusedWhereTooManyBytesOfLogDataWaitAlready) {
+  const auto other = place(RunningUploads::kMostLogDataBytesAtOnce - 1000);
+  ASSERT_TRUE(other.has_value());
+  log().expectError(kNoRoom);
+  startUpload(Array{std::string(1000, 'x')});
+  EXPECT_EQ(_outcome, false);
+  EXPECT_EQ(_connectivity->count(), 0u);
+  _outcome.reset();
+  startUpload();
+  EXPECT_EQ(_outcome, std::nullopt) << "a small one has room";
+  EXPECT_FALSE(place(1000).has_value()) << "and is counted";
+  log().expectError("Error uploading log data array ((null))");
+  uploads().cancelAll();
+  _world.runUntilIdle();
+}
+
+// Nothing is posted then, so it is no upload.
+TEST_F(WaitingLogDataTest, needsNoPlaceWithoutAConnectivityHelper) {
+  uploads().cancelAll();
+  _connectivity.reset();
+  EXPECT_TRUE(backend().uploadLogData({}));
 }
 
 }  // namespace

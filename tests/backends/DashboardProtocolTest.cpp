@@ -3,7 +3,6 @@
 
 #include <sstream>
 
-#include "platform/KeyedArchive.h"
 #include "tests/backends/DashboardFixture.h"
 #include "tests/backends/ProtocolPage.h"
 
@@ -43,10 +42,21 @@ TEST_F(DashboardProtocolTest, theExampleIsADatagramByteForByte) {
 
 TEST_F(DashboardProtocolTest, theLineIsWhatTheClientGets) { EXPECT_EQ(sendExample(), String(_page.example("line"))); }
 
-TEST_F(DashboardProtocolTest, theArchiveIsThatOfItsArray) {
-  const auto archive = keyedarchive::archive(Array{Dictionary{{Key("text"), "hi"}}});
-  ASSERT_TRUE(archive.has_value());
-  EXPECT_EQ(_page.example("archive"), hexadecimal({archive->bytes(), archive->size()}));
+TEST_F(DashboardProtocolTest, theLogDataArePostedAsThePageSays) {
+  _profile.set(kProfilePostURL, "https://collector.example/logdata");
+  make();
+  const auto session = _process.platform().dispatch.newSerialQueue("session");
+  session->async([this] { backend().uploadLogData(Array{Dictionary{{Key("text"), "hi"}}}); });
+  _world.runUntilIdle();
+  ASSERT_EQ(_connectivity->count(), 1u);
+  const URLRequest request = _connectivity->lastRequest();
+  EXPECT_EQ(request.url, "https://collector.example/logdata") << "as the profile has it";
+  EXPECT_EQ(request.method, "POST");
+  EXPECT_EQ(_page.example("log data headers"), headerLines(request));
+  EXPECT_EQ(_page.example("archive"), hexadecimal({request.body.bytes(), request.body.size()}));
+  log().expectError("DashboardBackend(uploadLogData): Error uploading log data array ((null))");
+  _connectivity->answer(0, 200);
+  _world.runUntilIdle();
 }
 
 TEST_F(DashboardProtocolTest, theScheduleIsThatOfTheBackend) {

@@ -250,7 +250,8 @@ TEST_F(UploadBackendTest, looksAtNoFileForWhichThereIsNoPlace) {
   makeUploadBackend();
   std::vector<RunningUploads::Place> others;
   for (size_t i = 0; i < RunningUploads::kMostAtOnce; ++i) {
-    others.push_back(*context().runningUploads().begin(process().platform().dispatch.newSemaphore(0), 0));
+    others.push_back(*context().runningUploads().begin(RunningUploads::Kind::LogData,
+                                                       process().platform().dispatch.newSemaphore(0), 0));
   }
   log().expectError("UploadBackend(uploadFileAtPath): Too much is being uploaded already");
   EXPECT_FALSE(upload());

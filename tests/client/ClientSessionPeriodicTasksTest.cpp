@@ -5,6 +5,7 @@
 
 #include "client/ClientSession.h"
 #include "tests/client/ClientFixture.h"
+#include "tests/support/NotedTimers.h"
 
 namespace telvane::testing {
 namespace {
@@ -233,6 +234,21 @@ TEST_F(ClientSessionPeriodicTasksTest, doesNothingWithoutATimerToBeHad) {
   session->startLogTimerWithInterval(1, 1, 5, 6);
   run();
   EXPECT_TRUE(hasLines(log(), 1, "startLogTimerWithInterval: 1, 1"));
+  session.reset();
+  run();
+}
+
+// So that a device with many such timers wakes up for several of them at once.
+TEST_F(ClientSessionPeriodicTasksTest, letsEachTickComeUpTo100MillisecondsLate) {
+  NotedTimers noted(client().platform().dispatch);
+  const Platform& platform = client().platform();
+  ClientContext context{ClientPlatform(platform.clock, noted, platform.log, platform.random, platform.userDefaults,
+                                       platform.localService)};
+  std::shared_ptr<Telvane> session = TelvaneFactory::initWithSessionInfo(context, sessionInfo());
+  session->startLogTimerWithInterval(1, 1, 5, 6);
+  _world.advance(2500ms);
+  EXPECT_THAT(noted.leeways(), ElementsAre(100ms, 100ms, 100ms, 100ms)) << "at 0, 1, 2 and 3 seconds";
+  session->stopLogTimer();
   session.reset();
   run();
 }

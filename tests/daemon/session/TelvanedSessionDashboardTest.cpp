@@ -57,10 +57,15 @@ TEST_F(TelvanedSessionDashboardTest, anHTTPSBackendsAnswerGoesFirst) {
 TEST_F(TelvanedSessionDashboardTest, whatSessionsShareIsNotSent) {
   givenAcknowledgements();
   givenSection(onlyADashboard());
-  const auto client = startSession();
-  client->tell(ClientSessionOperation::UpdateSharedDataWithDictionary, {Dictionary{{Key("shared"), 1}}});
+  const auto root = startSession(sessionInfoIn("call", 0, 1));
+  const auto client = startSession(sessionInfoIn("call", 1, 2));
+  const Dictionary shared{{Key("shared"), 1}};
+  root->tell(ClientSessionOperation::UpdateSharedDataWithDictionary, {shared});
+  ASSERT_EQ(agent().sharedDataForSession(*sessions().back()), shared) << "both have it";
   client->send(7, 2, {{Key("own"), 2}});
+  client->sendMessage(Dictionary{{kTelvaneMessageParametersCategory, 8}, {kTelvaneMessageParametersType, 2}});
   EXPECT_THAT(texts(7), ::testing::ElementsAre(" own=2"));
+  EXPECT_THAT(texts(8), ::testing::ElementsAre("")) << "a message without a payload";
 }
 
 TEST_F(TelvanedSessionDashboardTest, aOneShotMessageIsSentAndItsSocketClosed) {
