@@ -24,6 +24,12 @@ Error cannotServe(const CollectorOptions& options, const Error& reason) {
                   options.certificateFile, options.privateKeyFile, reason.description()));
 }
 
+// To a device that has log data to post, at whatever path its bag says, any text is the location where they lie.
+// Whoever reads an answer asks with GET.
+HTTPServer::Response refusal(const HTTPServer::Request& request, int status, std::string_view text) {
+  return request.method == "GET" ? textResponse(status, text) : HTTPServer::Response{.status = status};
+}
+
 std::string_view pathOf(std::string_view target) { return target.substr(0, target.find('?')); }
 
 }  // namespace
@@ -94,10 +100,8 @@ HTTPServer::Response Collector::answer(const HTTPServer::Request& request) {
   if (path == kStatisticsPath && isGet) return statistics();
   const bool isServed = path.starts_with(kStorebagsPath) || path == kEventsPath || path == kUploadPath ||
                         path == kLogDataPath || path == kStatisticsPath;
-  if (isServed) {
-    return textResponse(405, "this method is not served here\n");
-  }
-  return textResponse(404, "nothing is served here\n");
+  if (isServed) return refusal(request, 405, "this method is not served here\n");
+  return refusal(request, 404, "nothing is served here\n");
 }
 
 HTTPServer::Response Collector::statistics() const {

@@ -18,6 +18,12 @@ HTTPServer::Response textResponse(int status, std::string text) {
   return {status, {{"Content-Type", "text/plain"}}, Data(std::move(text))};
 }
 
+// A device takes whatever text answers log data for their location, whatever the status: only silence refuses them.
+HTTPServer::Response refusal(UploadStore::Kind kind, int status, std::string text) {
+  return kind == UploadStore::Kind::LogData ? HTTPServer::Response{.status = status}
+                                            : textResponse(status, std::move(text));
+}
+
 // What a device says of itself may be anything.
 std::string onlyPrintable(std::string text) {
   for (char& c : text) c = c > ' ' && c <= '~' ? c : '_';
@@ -52,20 +58,20 @@ std::shared_ptr<HTTPServer::BodySink> UploadStore::newSink() const {
 }
 
 HTTPServer::Response UploadStore::take(Kind kind, const HTTPServer::Request& request) {
-  if (_folder.empty()) return textResponse(kForbidden, "uploads are not taken; start with --uploads FOLDER\n");
+  if (_folder.empty()) return refusal(kind, kForbidden, "uploads are not taken; start with --uploads FOLDER\n");
   const auto sink = std::dynamic_pointer_cast<Sink>(request.sink);
-  if (sink == nullptr) return textResponse(400, "the upload has no body\n");
-  if (sink->file().has_error()) return cannotKeep(sink->file().error());
+  if (sink == nullptr) return refusal(kind, 400, "the upload has no body\n");
+  if (sink->file().has_error()) return cannotKeep(kind, sink->file().error());
   ReceivedFile& file = **sink->file();
   const Result<std::string> name = file.keepAs(kind == Kind::File ? uploadName(request.target) : kLogDataName);
-  if (name.has_error()) return cannotKeep(name.error());
+  if (name.has_error()) return cannotKeep(kind, name.error());
   return kept(kind, request, *name, file.size());
 }
 
 // Devices look for one word in the answer, whatever its status: a name or folder of the text must not bring it in.
-HTTPServer::Response UploadStore::cannotKeep(const Error& error) {
+HTTPServer::Response UploadStore::cannotKeep(Kind kind, const Error& error) {
   if (_listener) _listener("an upload was lost: " + error.description());
-  return textResponse(kInternalError, "the upload cannot be kept\n");
+  return refusal(kind, kInternalError, "the upload cannot be kept\n");
 }
 
 HTTPServer::Response UploadStore::kept(Kind kind, const HTTPServer::Request& request, const std::string& name,

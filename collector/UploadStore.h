@@ -27,8 +27,8 @@ class UploadStore {
   // Returns what takes the body of the upload; without a folder it drops it, whatever its size.
   std::shared_ptr<HTTPServer::BodySink> newSink() const;
   // Keeps what the request's sink has taken, and answers: a file with JSON whose "result" is "success", log data with
-  // the location where they are kept, as text; 403 without a folder, 500 when they cannot be kept (the listener hears
-  // why).
+  // the location where they are kept, as text; 403 without a folder, 400 without a body, 500 when they cannot be kept
+  // (the listener hears why). A refusal of log data has no body.
   HTTPServer::Response take(Kind kind, const HTTPServer::Request& request);
 
   uint64_t files() const noexcept { return _files; }
@@ -39,7 +39,7 @@ class UploadStore {
  private:
   class Sink;
   class DroppingSink;
-  HTTPServer::Response cannotKeep(const Error& error);
+  HTTPServer::Response cannotKeep(Kind kind, const Error& error);
   HTTPServer::Response kept(Kind kind, const HTTPServer::Request& request, const std::string& name, uint64_t size);
 
   const std::string _folder;

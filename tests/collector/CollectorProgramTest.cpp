@@ -83,13 +83,13 @@ TEST_F(CollectorProgramTest, saysWhenTheCertificateCannotBeRead) {
 // A device that posts a file by hand, so that it can stop in the middle. What does not work fails the test.
 class ManualUpload {
  public:
-  ManualUpload(const std::string& address, const std::string& path, size_t length)
+  ManualUpload(const std::string& address, const std::string& path, size_t length, const char* method = "POST")
       : _context(::SSL_CTX_new(::TLS_client_method()), &::SSL_CTX_free),
         _line(::BIO_new_ssl_connect(_context.get()), &::BIO_free_all) {
     ::BIO_set_conn_hostname(_line.get(), address.c_str());
     EXPECT_EQ(::BIO_do_connect(_line.get()), 1);
-    send("POST " + path + " HTTP/1.1\r\nHost: " + address + "\r\nContent-Length: " + std::to_string(length) +
-         "\r\n\r\n");
+    send(std::string(method) + " " + path + " HTTP/1.1\r\nHost: " + address +
+         "\r\nContent-Length: " + std::to_string(length) + "\r\n\r\n");
   }
   void send(std::string_view bytes) {
     while (!bytes.empty()) {
@@ -115,6 +115,10 @@ class ManualUpload {
   const std::unique_ptr<BIO, decltype(&::BIO_free_all)> _line;
 };
 
+constexpr char kHeadsEnd[] = "\r\n\r\n";
+// The rest of an answer that has no body, up to the end of its head.
+constexpr char kNoBody[] = "(.|\n)*\r\nContent-Length: 0\r\n(.|\n)*\r\n";
+
 TEST_F(CollectorProgramTest, withoutAFolderForThemItForbidsUploadsOfAnySize) {
   const auto collector = start("127.0.0.1:0", _server.certificateFile);
   const std::string served = address(*collector);
@@ -122,13 +126,34 @@ TEST_F(CollectorProgramTest, withoutAFolderForThemItForbidsUploadsOfAnySize) {
   // The most that is gathered in memory, and more.
   constexpr size_t kMegabytes = 65;
   const std::string megabyte(1u << 20, 'x');
-  for (const char* path : {"/upload?filename=log&raw=true", "/logdata"}) {
+  const auto answerTo = [&](const char* path, const char* end) {
     ManualUpload upload(served, path, kMegabytes * megabyte.size());
     for (size_t i = 0; i < kMegabytes; ++i) upload.send(megabyte);
-    EXPECT_THAT(upload.answerUntil("FOLDER\n"),
-                MatchesRegex("HTTP/1.1 403 (.|\n)*uploads are not taken; start with --uploads FOLDER\n"))
-        << path;
-  }
+    return upload.answerUntil(end);
+  };
+  EXPECT_THAT(answerTo("/upload?filename=log&raw=true", "FOLDER\n"),
+              MatchesRegex("HTTP/1.1 403 (.|\n)*uploads are not taken; start with --uploads FOLDER\n"));
+  EXPECT_THAT(answerTo("/logdata", kHeadsEnd), MatchesRegex(std::string("HTTP/1.1 403 ") + kNoBody));
+}
+
+// Whatever path a bag gives for log data: any text would be their location.
+TEST_F(CollectorProgramTest, saysNothingToAPostThatLeadsNowhere) {
+  const auto collector = start("127.0.0.1:0", _server.certificateFile, {"--uploads", _scratch.at("uploads")});
+  const std::string served = address(*collector);
+  ASSERT_NE(served, "");
+  const auto answerTo = [&served](const char* path, const char* method = "POST") {
+    ManualUpload post(served, path, 1, method);
+    post.send("x");
+    return post.answerUntil(kHeadsEnd);
+  };
+  EXPECT_THAT(answerTo("/logs"), MatchesRegex(std::string("HTTP/1.1 404 ") + kNoBody));
+  EXPECT_THAT(answerTo("/logdata/"), MatchesRegex(std::string("HTTP/1.1 404 ") + kNoBody));
+  EXPECT_THAT(answerTo("/statistics"), MatchesRegex(std::string("HTTP/1.1 405 ") + kNoBody));
+  EXPECT_THAT(answerTo("/logdata", "PUT"), MatchesRegex(std::string("HTTP/1.1 405 ") + kNoBody));
+  EXPECT_THAT(ManualUpload(served, "/logdata", 0).answerUntil(kHeadsEnd),
+              MatchesRegex(std::string("HTTP/1.1 400 ") + kNoBody));
+  EXPECT_THAT(ManualUpload(served, "/logs", 0, "GET").answerUntil("here\n"), HasSubstr("nothing is served here\n"))
+      << "who asks is told";
 }
 
 TEST_F(CollectorProgramTest, leavesNoHalfOfAnUploadBehindWhenItIsKilled) {

@@ -93,6 +93,29 @@ TEST_F(UploadStoreTest, refusesAnUploadWithoutABodyOrRoom) {
   EXPECT_EQ(nowhere.files(), 0u);
 }
 
+// A device takes any text for the location of its log data.
+TEST_F(UploadStoreTest, refusesLogDataWithoutAWord) {
+  HTTPServer::Request request;
+  request.target = "/logdata";
+  const auto withoutABody = _store.take(UploadStore::Kind::LogData, request);
+  EXPECT_EQ(withoutABody.status, 400);
+  EXPECT_EQ(text(withoutABody), "");
+  UploadStore nowhere("/proc/nothing", [this](const std::string& line) { _lines.push_back(line); });
+  request.sink = nowhere.newSink();
+  EXPECT_EQ(request.sink->take("x"), 500);
+  const auto withoutAFile = nowhere.take(UploadStore::Kind::LogData, request);
+  EXPECT_EQ(withoutAFile.status, 500);
+  EXPECT_EQ(text(withoutAFile), "");
+  UploadStore store(_scratch.at("gone"), nullptr);
+  request.sink = store.newSink();
+  ASSERT_EQ(request.sink->take("x"), 0);
+  std::filesystem::remove_all(_scratch.at("gone"));
+  const auto withoutAFolder = store.take(UploadStore::Kind::LogData, request);
+  EXPECT_EQ(withoutAFolder.status, 500);
+  EXPECT_EQ(text(withoutAFolder), "");
+  EXPECT_THAT(_lines, ElementsAre(::testing::StartsWith("an upload was lost: "))) << "here it is said why";
+}
+
 TEST_F(UploadStoreTest, neverSaysTheWordThatDeletesAFileThatIsNotKept) {
   UploadStore store(_scratch.at("success"), nullptr);
   HTTPServer::Request request;
@@ -109,14 +132,16 @@ TEST_F(UploadStoreTest, refusesEverythingWithoutAFolder) {
   UploadStore none("", nullptr);
   HTTPServer::Request request;
   EXPECT_EQ(none.take(UploadStore::Kind::File, request).status, 403) << "without a body";
+  EXPECT_EQ(text(none.take(UploadStore::Kind::LogData, request)), "");
   request.sink = none.newSink();
   ASSERT_NE(request.sink, nullptr) << "a body that is gathered has a bound";
   for (int i = 0; i < 1000; ++i) EXPECT_EQ(request.sink->take(std::string(1000, 'x')), 0);
-  for (const auto kind : {UploadStore::Kind::File, UploadStore::Kind::LogData}) {
-    const auto response = none.take(kind, request);
-    EXPECT_EQ(response.status, 403);
-    EXPECT_EQ(text(response), "uploads are not taken; start with --uploads FOLDER\n");
-  }
+  const auto ofAFile = none.take(UploadStore::Kind::File, request);
+  EXPECT_EQ(ofAFile.status, 403);
+  EXPECT_EQ(text(ofAFile), "uploads are not taken; start with --uploads FOLDER\n");
+  const auto ofLogData = none.take(UploadStore::Kind::LogData, request);
+  EXPECT_EQ(ofLogData.status, 403);
+  EXPECT_EQ(text(ofLogData), "") << "a text would be their location";
   EXPECT_EQ(none.bytes(), 0u);
   EXPECT_EQ(listing(), std::set<std::string>());
 }
