@@ -1,10 +1,6 @@
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
 
-#include <cstdlib>
-
-#include "tests/support/ChildProcess.h"
-#include "tests/support/ScratchFolder.h"
+#include "tests/bench/BenchProgram.h"
 
 namespace telvane::testing {
 namespace {
@@ -12,21 +8,9 @@ namespace {
 using ::testing::HasSubstr;
 using ::testing::Not;
 
-// The measuring program of bench/, run to its end.
-class RoadProgramTest : public ::testing::Test {
+class RoadProgramTest : public BenchProgramTest {
  protected:
-  int run(std::vector<std::string> arguments) {
-    arguments.insert(arguments.begin(), std::string(TELVANE_PROGRAM_DIR) + "/telvane-bench-road");
-    const char* folder = std::getenv("TMPDIR");
-    const std::vector<std::string> environment{"TMPDIR=" + std::string(folder != nullptr ? folder : "/tmp")};
-    ChildProcess program(arguments, environment, {_scratch.at("out"), _scratch.at("err")});
-    return program.wait(std::chrono::seconds(100));
-  }
-  std::string output() const { return _scratch.read("out"); }
-  std::string errors() const { return _scratch.read("err"); }
-
- private:
-  ScratchFolder _scratch;
+  RoadProgramTest() : BenchProgramTest("road") {}
 };
 
 TEST_F(RoadProgramTest, everyEventOfEveryPartArrivesOnce) {
