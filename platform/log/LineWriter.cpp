@@ -1,5 +1,6 @@
 #include "platform/log/LineWriter.h"
 
+#include <fmt/format.h>
 #include <limits.h>
 #include <poll.h>
 #include <sys/stat.h>
@@ -22,6 +23,38 @@ constexpr size_t kFileChunk = 64u << 10;
 size_t chunkSizeFor(int descriptor) {
   struct stat status;
   return fstat(descriptor, &status) == 0 && S_ISREG(status.st_mode) ? kFileChunk : kPipeChunk;
+}
+
+constexpr unsigned char kFirstOfTwoByteControl = 0xC2;
+
+bool mayBeControl(char byte) {
+  const auto value = static_cast<unsigned char>(byte);
+  return value < 0x20 || value == 0x7F || value == kFirstOfTwoByteControl;
+}
+
+// The number of bytes of the control character that the text begins with; 0 when it begins with none. U+0080 to U+009F
+// are controls too, of two bytes in UTF-8.
+size_t controlAtStart(std::string_view text) {
+  if (!mayBeControl(text.front())) return 0;
+  if (static_cast<unsigned char>(text.front()) != kFirstOfTwoByteControl) return 1;
+  const auto second = text.size() > 1 ? static_cast<unsigned char>(text[1]) : 0;
+  return second >= 0x80 && second < 0xA0 ? 2 : 0;
+}
+
+std::string withoutControls(std::string_view text) {
+  std::string escaped;
+  while (!text.empty()) {
+    const size_t control = controlAtStart(text);
+    if (text.front() == '\n') {
+      escaped.append("\\n");
+    } else if (control != 0) {
+      escaped += fmt::format("\\x{:02x}", static_cast<unsigned char>(text[control - 1]));
+    } else {
+      escaped.push_back(text.front());
+    }
+    text.remove_prefix(std::max<size_t>(control, 1));
+  }
+  return escaped;
 }
 
 // Returns the size of the first piece to write: whole lines if one fits.
@@ -48,6 +81,10 @@ LineWriter::~LineWriter() {
 }
 
 void LineWriter::append(std::string_view prefix, std::string_view text) {
+  std::string escaped;
+  if (std::any_of(text.begin(), text.end(), mayBeControl)) {
+    text = escaped = withoutControls(text.substr(0, _options.maximumBytes));
+  }
   bool mustWake;
   {
     MutexLock lock(_mutex);
@@ -62,14 +99,8 @@ void LineWriter::append(std::string_view prefix, std::string_view text) {
 void LineWriter::addLine(std::string_view prefix, std::string_view text) {
   const size_t roomForText = _options.maximumBytes - std::min(_options.maximumBytes, prefix.size() + 1);
   if (text.size() > roomForText) text = text.substr(0, roomForText);
-  const size_t lineFeeds = static_cast<size_t>(std::count(text.begin(), text.end(), '\n'));
-  makeRoom(prefix.size() + text.size() + lineFeeds + 1);
-  _lines.append(prefix);
-  for (size_t end = text.find('\n'); end != std::string_view::npos; end = text.find('\n')) {
-    _lines.append(text.substr(0, end)).append("\\n");
-    text.remove_prefix(end + 1);
-  }
-  _lines.append(text).push_back('\n');
+  makeRoom(prefix.size() + text.size() + 1);
+  _lines.append(prefix).append(text).push_back('\n');
 }
 
 void LineWriter::makeRoom(size_t bytes) {

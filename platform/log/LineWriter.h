@@ -47,8 +47,9 @@ class LineWriter {
   LineWriter(const LineWriter&) = delete;
   LineWriter& operator=(const LineWriter&) = delete;
 
-  // Adds one line: the prefix as it is, the text with "\n" for each line feed, a line feed. Text that would fill the
-  // whole buffer is cut.
+  // Adds one line: the prefix as it is, the text, a line feed. In the text "\n" stands for a line feed and "\x1b" or
+  // the like for any other control character, which a terminal would act on. Text that would fill the whole buffer is
+  // cut.
   void append(std::string_view prefix, std::string_view text);
   // Waits until all lines appended so far have been written, for at most `flushTime`.
   void flush();

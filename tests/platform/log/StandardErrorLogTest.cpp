@@ -103,6 +103,21 @@ TEST_F(StandardErrorLogTest, writesAMessageOfSeveralLinesAsOne) {
   EXPECT_EQ(endLogAndRead(), prefix("default") + "{\\n    a = 1;\\n}\\n\n" + prefix("default") + "\n");
 }
 
+// A client's path or name may hold them, and an operator reads lines in a terminal.
+TEST_F(StandardErrorLogTest, writesNoControlCharacterThatATerminalWouldActOn) {
+  givenLog(LogLevel::Default)
+      .message("{}", "bell\a esc\x1b[2J del\x7f csi\xc2\x9b m tab\t; \xc2\xa0\xc3\xa9, a lone \xc2");
+  EXPECT_EQ(endLogAndRead(),
+            prefix("default") + "bell\\x07 esc\\x1b[2J del\\x7f csi\\x9b m tab\\x09; \xc2\xa0\xc3\xa9, a lone \xc2\n");
+}
+
+TEST_F(StandardErrorLogTest, cutsAMessageThatGrowsBeyondTheBufferByBeingWrittenSo) {
+  givenLog(LogLevel::Default, {.maximumBytes = 1000}).message("{}", std::string(900, '\a'));
+  const std::string text = endLogAndRead();
+  EXPECT_EQ(text.size(), 1000u);
+  EXPECT_EQ(text.substr(prefix("default").size(), 8), "\\x07\\x07");
+}
+
 TEST_F(StandardErrorLogTest, padsEachPartOfTheTime) {
   givenLog(LogLevel::Default, {}, Date(Date::TimePoint(5us))).message("x");
   EXPECT_EQ(endLogAndRead(), prefix("default", "1970-01-01T00:00:00.000005Z") + "x\n");
