@@ -10,6 +10,7 @@
 #include "platform/dispatch/SystemClock.h"
 #include "platform/dispatch/ThreadedDispatch.h"
 #include "tests/backends/DashboardFixture.h"
+#include "tests/support/PlatformWith.h"
 
 namespace telvane::testing {
 namespace {
@@ -69,34 +70,13 @@ class DashboardThreadsTest : public DashboardFixture {
       EXPECT_TRUE(backend.sendMessage({{Key("n"), n}}, _clock.now(), 7, 2, 0).has_value());
     }
   }
-  Platform threadedPlatform(const Platform& base) {
-    return {_clock,
-            base.random,
-            _threads,
-            _log,
-            base.files,
-            base.userDefaults,
-            base.deviceAnswers,
-            base.locale,
-            base.consent,
-            base.clientBundle,
-            base.urlSessions,
-            base.transactions,
-            base.localService,
-            base.submittableLogs,
-            base.processMemory,
-            _sockets,
-            base.sandboxExtensions,
-            base.wirelessDiagnostics,
-            base.powerLog};
-  }
 
   SystemClock _clock;
   RecordingLog _log;
   ThreadedDispatch _threads;
   Dispatch& _dispatch = _threads;
   SystemDatagramSockets _sockets;
-  Platform _threaded = threadedPlatform(_process.platform());
+  Platform _threaded = platformWith(_process.platform(), _clock, _log, _threads, _sockets);
   ProcessContext _threadedContext{_threaded};
   std::atomic<int> _arrived{0};
   std::unique_ptr<DatagramServer> _server;
