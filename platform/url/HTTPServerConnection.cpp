@@ -243,12 +243,13 @@ void Connection<Stream>::headCame(ErrorCode error) {
   _keepsAlive = head.keep_alive();
   _isHeadRequest = head.method() == http::verb::head;
   const bool isToContinue = beast::iequals(head[http::field::expect], "100-continue");
+  const uint64_t length = _parser->content_length().value_or(0);
   chooseSink();
-  if (!_pieceRequest) {
-    const uint64_t maximum = _server->options.maximumBodyBytes;
-    _parser->body_limit(maximum);
-    if (_parser->content_length().value_or(0) > maximum) return refuse(http::error::body_limit);
-  }
+  const HTTPServer::Options& options = _server->options;
+  const uint64_t maximum = _pieceRequest ? options.maximumPiecewiseBodyBytes : options.maximumBodyBytes;
+  _pieceRequest ? _pieceParser->body_limit(maximum) : _parser->body_limit(maximum);
+  // The parsers themselves compare a length only with the limit that they had when the head came.
+  if (length > maximum) return refuse(http::error::body_limit);
   isToContinue ? continueThenReadBody() : readBody();
 }
 
@@ -260,7 +261,6 @@ void Connection<Stream>::chooseSink() {
   if (head.sink == nullptr) return;
   _pieceRequest = std::move(head);
   _pieceParser.emplace(std::move(*_parser));
-  _pieceParser->body_limit(_server->options.maximumPiecewiseBodyBytes);
   _piece.resize(kPieceBytes);
 }
 

@@ -166,6 +166,22 @@ TEST_F(HTTPServerSinkTest, gathersWhatNoSinkTakesAndBoundsIt) {
               StartsWith("HTTP/1.1 413 "));
 }
 
+TEST_F(HTTPServerSinkTest, refusesWhatIsTooMuchForASinkTooAndSaysNothingMore) {
+  _serverOptions.maximumPiecewiseBodyBytes = 20;
+  const std::string tooMuch(21, 'x');
+  const std::string answers[] = {
+      answerTo("POST /sink HTTP/1.1\r\nContent-Length: 21\r\n\r\n" + tooMuch),
+      answerTo("POST /sink HTTP/1.1\r\nExpect: 100-continue\r\nContent-Length: 21\r\n\r\n"),
+      answerTo("POST /sink HTTP/1.1\r\nTransfer-Encoding: chunked\r\n\r\n15\r\n" + tooMuch + "\r\n0\r\n\r\n")};
+  for (const std::string& answer : answers) {
+    EXPECT_THAT(answer, StartsWith("HTTP/1.1 413 "));
+    EXPECT_EQ(body(answer), "");
+  }
+  EXPECT_EQ(
+      body(answerTo("POST /sink HTTP/1.1\r\nConnection: close\r\nContent-Length: 20\r\n\r\n" + tooMuch.substr(1))),
+      tooMuch.substr(1) + "|");
+}
+
 TEST_F(HTTPServerSinkTest, asksNobodyForARequestWithoutABody) {
   EXPECT_EQ(body(answerTo("POST /sink HTTP/1.1\r\nConnection: close\r\nContent-Length: 0\r\n\r\n")), "nothing|");
 }
