@@ -7,6 +7,7 @@
 
 #include "tests/backends/DashboardFixture.h"
 #include "tests/support/NotedTimers.h"
+#include "tests/support/PassingDispatch.h"
 #include "tests/support/PlatformWith.h"
 
 namespace telvane::testing {
@@ -203,30 +204,21 @@ TEST_F(DashboardInitTest, staysReliableWithoutAReader) {
 }
 
 // Has so many timers and then none any more, and says so in one of two ways.
-class TimerlessDispatch final : public Dispatch {
+class TimerlessDispatch final : public PassingDispatch {
  public:
   TimerlessDispatch(Dispatch& dispatch, bool throws, int timers = 0)
-      : _dispatch(dispatch), _throws(throws), _timers(timers) {}
-  std::shared_ptr<SerialQueue> newSerialQueue(std::string label, QualityOfService qos) override {
-    return _dispatch.newSerialQueue(std::move(label), qos);
-  }
-  std::shared_ptr<ConcurrentQueue> newConcurrentQueue(std::string label, QualityOfService qos) override {
-    return _dispatch.newConcurrentQueue(std::move(label), qos);
-  }
+      : PassingDispatch(dispatch), _throws(throws), _timers(timers) {}
   std::unique_ptr<Timer> newTimer(std::shared_ptr<SerialQueue> queue, std::chrono::nanoseconds delay,
                                   std::chrono::nanoseconds leeway, Job onFire, Job onCancel) override {
     if (_timers > 0) {
       --_timers;
-      return _dispatch.newTimer(std::move(queue), delay, leeway, std::move(onFire), std::move(onCancel));
+      return PassingDispatch::newTimer(std::move(queue), delay, leeway, std::move(onFire), std::move(onCancel));
     }
     if (_throws) throw std::system_error(EAGAIN, std::generic_category());
     return nullptr;
   }
-  std::shared_ptr<Semaphore> newSemaphore(unsigned count) override { return _dispatch.newSemaphore(count); }
-  std::unique_ptr<Monitor> newMonitor() override { return _dispatch.newMonitor(); }
 
  private:
-  Dispatch& _dispatch;
   const bool _throws;
   int _timers;
 };

@@ -2,6 +2,7 @@
 
 #include "client/ClientSession.h"
 #include "tests/client/ClientFixture.h"
+#include "tests/support/PassingDispatch.h"
 
 namespace telvane::testing {
 namespace {
@@ -15,22 +16,10 @@ class NoConnections final : public ipc::Service {
 };
 
 // Queues that cannot be made; everything else is another dispatch's.
-class NoSerialQueues final : public Dispatch {
+class NoSerialQueues final : public PassingDispatch {
  public:
-  explicit NoSerialQueues(Dispatch& other) : _other(other) {}
+  using PassingDispatch::PassingDispatch;
   std::shared_ptr<SerialQueue> newSerialQueue(std::string, QualityOfService) override { return nullptr; }
-  std::shared_ptr<ConcurrentQueue> newConcurrentQueue(std::string label, QualityOfService qos) override {
-    return _other.newConcurrentQueue(std::move(label), qos);
-  }
-  std::unique_ptr<Timer> newTimer(std::shared_ptr<SerialQueue> queue, std::chrono::nanoseconds delay,
-                                  std::chrono::nanoseconds leeway, Job onFire, Job onCancel) override {
-    return _other.newTimer(std::move(queue), delay, leeway, std::move(onFire), std::move(onCancel));
-  }
-  std::shared_ptr<Semaphore> newSemaphore(unsigned count) override { return _other.newSemaphore(count); }
-  std::unique_ptr<Monitor> newMonitor() override { return _other.newMonitor(); }
-
- private:
-  Dispatch& _other;
 };
 
 class ClientSessionInitTest : public ClientFixture {};

@@ -6,6 +6,7 @@
 #include "client/ClientSession.h"
 #include "tests/client/ClientFixture.h"
 #include "tests/support/NotedTimers.h"
+#include "tests/support/PassingDispatch.h"
 
 namespace telvane::testing {
 namespace {
@@ -16,26 +17,15 @@ using ::testing::ElementsAre;
 constexpr Key kA{"a"};
 
 // Dispatch without timers; everything else is another one's.
-class NoTimers final : public Dispatch {
+class NoTimers final : public PassingDispatch {
  public:
-  explicit NoTimers(Dispatch& other) : _other(other) {}
+  using PassingDispatch::PassingDispatch;
   bool refuses = true;
-  std::shared_ptr<SerialQueue> newSerialQueue(std::string label, QualityOfService qos) override {
-    return _other.newSerialQueue(std::move(label), qos);
-  }
-  std::shared_ptr<ConcurrentQueue> newConcurrentQueue(std::string label, QualityOfService qos) override {
-    return _other.newConcurrentQueue(std::move(label), qos);
-  }
   std::unique_ptr<Timer> newTimer(std::shared_ptr<SerialQueue> queue, std::chrono::nanoseconds delay,
                                   std::chrono::nanoseconds leeway, Job onFire, Job onCancel) override {
     if (refuses) return nullptr;
-    return _other.newTimer(std::move(queue), delay, leeway, std::move(onFire), std::move(onCancel));
+    return PassingDispatch::newTimer(std::move(queue), delay, leeway, std::move(onFire), std::move(onCancel));
   }
-  std::shared_ptr<Semaphore> newSemaphore(unsigned count) override { return _other.newSemaphore(count); }
-  std::unique_ptr<Monitor> newMonitor() override { return _other.newMonitor(); }
-
- private:
-  Dispatch& _other;
 };
 
 // A session whose log timer runs under virtual time, and a daemon that takes what it sends.

@@ -2,11 +2,11 @@
 #include <gmock/gmock.h>
 
 #include <atomic>
-#include <condition_variable>
 
 #include "interfaces/EventKeys.h"
 #include "interfaces/SessionKeys.h"
 #include "interfaces/StorebagKeys.h"
+#include "tests/endtoend/Latch.h"
 #include "tests/endtoend/WireFixture.h"
 #include "tests/support/Matchers.h"
 
@@ -18,25 +18,6 @@ using Answer = WireServer::Answer;
 using Then = WireServer::Then;
 
 constexpr uint16_t kEvent = 21;
-
-// A gate that a server waits at; opened once.
-class Latch {
- public:
-  void open() {
-    const std::lock_guard lock(_mutex);
-    _isOpen = true;
-    _opened.notify_all();
-  }
-  void wait() {
-    std::unique_lock lock(_mutex);
-    _opened.wait(lock, [this] { return _isOpen; });
-  }
-
- private:
-  std::mutex _mutex;
-  std::condition_variable _opened;
-  bool _isOpen = false;
-};
 
 bool hasEvent(const WireRequest& post, int64_t number) {
   return post.header("X-TVN-Event-Map") == "21 " + std::to_string(number);

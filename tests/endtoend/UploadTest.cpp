@@ -10,11 +10,9 @@
 #include <unistd.h>
 
 #include <chrono>
-#include <condition_variable>
 #include <filesystem>
 #include <fstream>
 #include <future>
-#include <mutex>
 #include <random>
 
 #include "interfaces/ClientSessionInterface.h"
@@ -27,6 +25,7 @@
 #include "platform/system/FileDescriptor.h"
 #include "platform/system/PosixFileSystem.h"
 #include "tests/endtoend/Instance.h"
+#include "tests/endtoend/Latch.h"
 #include "tests/endtoend/WireFixture.h"
 #include "tests/support/RecordingLog.h"
 
@@ -259,25 +258,6 @@ TEST_F(UploadTest, aLargeFileTakesNoMemory) {
   EXPECT_LT(peakMemory(instance.daemon().pid()) - before, kMostKiB) << "for 24 MiB that do not";
   EXPECT_TRUE(arrived("noise.gz") == noise);
 }
-
-// A gate that a server waits at; opened once.
-class Latch {
- public:
-  void open() {
-    const std::lock_guard lock(_mutex);
-    _isOpen = true;
-    _opened.notify_all();
-  }
-  void wait() {
-    std::unique_lock lock(_mutex);
-    _opened.wait(lock, [this] { return _isOpen; });
-  }
-
- private:
-  std::mutex _mutex;
-  std::condition_variable _opened;
-  bool _isOpen = false;
-};
 
 // A server of the test's own, which sees the bytes and answers what it likes.
 class UploadOverTheWireTest : public WireFixture {

@@ -12,6 +12,7 @@
 #include "platform/dispatch/SystemClock.h"
 #include "platform/dispatch/ThreadedDispatch.h"
 #include "tests/platform/dispatch/Waiting.h"
+#include "tests/support/PassingDispatch.h"
 #include "tests/support/SimulatedWorld.h"
 
 namespace telvane::testing {
@@ -21,33 +22,22 @@ using namespace std::chrono_literals;
 using ::testing::ElementsAre;
 
 // Another dispatch, whose timers the test may refuse, or hold back on the way to who asked for them.
-class OtherTimers final : public Dispatch {
+class OtherTimers final : public PassingDispatch {
  public:
-  explicit OtherTimers(Dispatch& other) : _other(other) {}
+  using PassingDispatch::PassingDispatch;
   // Before a new timer is handed over.
   std::function<void()> onNewTimer;
   bool refuses = false;
   bool throws = false;  // when it refuses
 
-  std::shared_ptr<SerialQueue> newSerialQueue(std::string label, QualityOfService qos) override {
-    return _other.newSerialQueue(std::move(label), qos);
-  }
-  std::shared_ptr<ConcurrentQueue> newConcurrentQueue(std::string label, QualityOfService qos) override {
-    return _other.newConcurrentQueue(std::move(label), qos);
-  }
   std::unique_ptr<Timer> newTimer(std::shared_ptr<SerialQueue> queue, std::chrono::nanoseconds delay,
                                   std::chrono::nanoseconds leeway, Job onFire, Job onCancel) override {
     if (refuses && throws) throw std::system_error(EAGAIN, std::generic_category());
     if (refuses) return nullptr;
-    auto timer = _other.newTimer(std::move(queue), delay, leeway, std::move(onFire), std::move(onCancel));
+    auto timer = PassingDispatch::newTimer(std::move(queue), delay, leeway, std::move(onFire), std::move(onCancel));
     if (onNewTimer) std::exchange(onNewTimer, nullptr)();
     return timer;
   }
-  std::shared_ptr<Semaphore> newSemaphore(unsigned count) override { return _other.newSemaphore(count); }
-  std::unique_ptr<Monitor> newMonitor() override { return _other.newMonitor(); }
-
- private:
-  Dispatch& _other;
 };
 
 class RepeatingTimerTest : public ::testing::Test {

@@ -14,6 +14,7 @@
 
 #include "tests/platform/url/Peers.h"
 #include "tests/platform/url/URLSessionFixture.h"
+#include "tests/support/PassingDispatch.h"
 
 namespace telvane::testing {
 
@@ -37,16 +38,10 @@ class FixedProbe final : public ConnectivityProbe {
 };
 
 // Threads as ever, but timers fire when the test says so.
-class TimerlessDispatch final : public Dispatch {
+class TimerlessDispatch final : public PassingDispatch {
  public:
-  explicit TimerlessDispatch(Dispatch& real) : _real(real) {}
+  using PassingDispatch::PassingDispatch;
 
-  std::shared_ptr<SerialQueue> newSerialQueue(std::string label, QualityOfService qos) override {
-    return _real.newSerialQueue(std::move(label), qos);
-  }
-  std::shared_ptr<ConcurrentQueue> newConcurrentQueue(std::string label, QualityOfService qos) override {
-    return _real.newConcurrentQueue(std::move(label), qos);
-  }
   std::unique_ptr<Timer> newTimer(std::shared_ptr<SerialQueue> queue, std::chrono::nanoseconds delay,
                                   std::chrono::nanoseconds, Job onFire, Job) override {
     const std::lock_guard lock(_mutex);
@@ -55,8 +50,6 @@ class TimerlessDispatch final : public Dispatch {
     _changed.notify_all();
     return std::make_unique<NoTimer>();
   }
-  std::shared_ptr<Semaphore> newSemaphore(unsigned count) override { return _real.newSemaphore(count); }
-  std::unique_ptr<Monitor> newMonitor() override { return _real.newMonitor(); }
 
   // Waits for the next timer and fires it.
   void fireNext() {
@@ -75,7 +68,6 @@ class TimerlessDispatch final : public Dispatch {
     void cancel() override {}
   };
 
-  Dispatch& _real;
   std::mutex _mutex;
   std::condition_variable _changed;
   std::vector<std::chrono::milliseconds> _delays;
