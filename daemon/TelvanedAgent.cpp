@@ -181,7 +181,7 @@ void TelvanedAgent::removeObjectFromSharedDataForSession(TelvanedSession& sessio
   const std::optional<String> token = session.hierarchyToken();
   if (!token.has_value()) return;
   MonitorLock lock(*_monitor);
-  const auto found = _sharedData.find(token->str());
+  const auto found = _sharedData.find(token->view());
   if (found != _sharedData.end()) found->second.remove(key);
 }
 
@@ -189,7 +189,7 @@ std::optional<Dictionary> TelvanedAgent::sharedDataForSession(TelvanedSession& s
   const std::optional<String> token = session.hierarchyToken();
   if (!token.has_value()) return std::nullopt;
   MonitorLock lock(*_monitor);
-  const auto found = _sharedData.find(token->str());
+  const auto found = _sharedData.find(token->view());
   if (found == _sharedData.end()) return std::nullopt;
   return found->second.entries();
 }

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <array>
+#include <functional>
 #include <map>
 #include <memory>
 #include <string>
@@ -115,8 +116,8 @@ class TelvanedAgent : public TelvanedSessionDelegate,
   // Guarded by the monitor.
   std::vector<std::shared_ptr<TelvanedSession>> _sessionList GUARDED_BY(*_monitor);
   Dictionary _cachedStorebags GUARDED_BY(*_monitor);  // storebag name -> record
-  std::map<std::string, CorrelatedSessions> _correlatedSessions GUARDED_BY(*_monitor);
-  std::map<std::string, HierarchySharedData> _sharedData GUARDED_BY(*_monitor);
+  std::map<std::string, CorrelatedSessions, std::less<>> _correlatedSessions GUARDED_BY(*_monitor);
+  std::map<std::string, HierarchySharedData, std::less<>> _sharedData GUARDED_BY(*_monitor);
   int32_t _xpcTransactionReference GUARDED_BY(*_monitor) = 0;
   std::array<uint8_t, kClientTypeCounters> _activeClients GUARDED_BY(*_monitor){};
 

@@ -11,7 +11,7 @@ bool TelvanedAgent::isListed(const CorrelatedSessions& list, const TelvanedSessi
 }
 
 TelvanedAgent::CorrelatedSessions* TelvanedAgent::correlatedSessions(const String& token) {
-  const auto found = _correlatedSessions.find(token.str());
+  const auto found = _correlatedSessions.find(token.view());
   return found != _correlatedSessions.end() && !found->second.empty() ? &found->second : nullptr;
 }
 
@@ -119,6 +119,12 @@ TelvanedSession* TelvanedAgent::getAncestorWithAggregatorForSession(TelvanedSess
   MonitorLock lock(*_monitor);
   const CorrelatedSessions* list = correlatedSessions(*token);
   if (list == nullptr) return nullptr;
+  // Asked for each event, and most hierarchies have no aggregator.
+  const auto isAggregating = [level](const auto& weak) {
+    const auto candidate = weak.lock();
+    return candidate != nullptr && candidate->hasAggregator() && candidate->hierarchyLevel() < level;
+  };
+  if (std::none_of(list->begin(), list->end(), isAggregating)) return nullptr;
   // The topmost aggregating one among those that stand for their level, found in one walk over the sessions there are.
   std::unordered_set<int64_t> seenLevels;
   TelvanedSession* topmost = nullptr;

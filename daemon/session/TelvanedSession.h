@@ -145,6 +145,8 @@ class TelvanedSession : public ClientSessionInterface, public std::enable_shared
   void internalSendMessage(const Value& payload, uint16_t method, uint16_t respCode);
   void internalFlushMessagesWithCompletion(FlushReply completion);
   void aggregateMessage(double timestamp, uint16_t category, uint16_t type, const Value& payload);
+  // What is aggregated of a payload; an absent value of none.
+  Value withUserInfo(const Value& payload) const;
 
   // States and event lists.
   bool updateReportingStates();

@@ -123,20 +123,22 @@ void TelvanedSession::internalSendMessage(const Value& payload, uint16_t method,
 void TelvanedSession::aggregateMessage(double timestamp, uint16_t category, uint16_t type, const Value& payload) {
   // Neither an ancestor nor an own aggregator: the usual case costs no lock and no copy.
   if (!_hierarchyDictionary.has_value() && !_hasAggregator) return;
-  Value aggregated;
-  if (const Dictionary* fields = payload.dictionary()) {
-    Dictionary copy = *fields;
-    if (const Dictionary* userInfo = _userInfo.dictionary()) copy.addEntriesFrom(*userInfo);
-    aggregated = std::move(copy);
-  }
   {
     MonitorLock lock(_sessionDelegate->monitor());
     if (TelvanedSession* ancestor = _sessionDelegate->getAncestorWithAggregatorForSession(*this)) {
-      ancestor->sendToAggregator(_sessionInfo, timestamp, category, type, aggregated);
+      ancestor->sendToAggregator(_sessionInfo, timestamp, category, type, withUserInfo(payload));
       return;
     }
   }
-  if (_hasAggregator) sendToAggregator(_sessionInfo, timestamp, category, type, aggregated);
+  if (_hasAggregator) sendToAggregator(_sessionInfo, timestamp, category, type, withUserInfo(payload));
+}
+
+Value TelvanedSession::withUserInfo(const Value& payload) const {
+  const Dictionary* fields = payload.dictionary();
+  if (fields == nullptr) return {};
+  Dictionary copy = *fields;
+  if (const Dictionary* userInfo = _userInfo.dictionary()) copy.addEntriesFrom(*userInfo);
+  return copy;
 }
 
 void TelvanedSession::sendToAggregator(const Value& sessionInfo, double timestamp, uint16_t category, uint16_t type,
