@@ -24,7 +24,7 @@ enum TelvaneBackendState : uint32_t {
   TelvaneBackendStateSampledOut = 3,  // events are held until a promoting message arrives
 };
 
-// The product type of the maker's desktop computers, which have no wireless diagnostics.
+// The product type of desktop devices, which have no wireless diagnostics.
 inline constexpr std::string_view kDesktopProductType = "Desktop";
 
 // One destination of a session's events. This base holds the identity, the state with its queue, the event lists, and

@@ -39,7 +39,7 @@ class TELVANE_EXPORT Error {
 };
 
 // The domain of what the platform itself reports (network, files, coding, the local connection); codes are errno
-// values, or those of PlatformErrorCode.
+// values, those of URLErrorCode for the network, or a code of who reports it, whose description tells more.
 inline constexpr Key kPlatformErrorDomain{"TelvanePlatform"};
 
 // A value or the Error that stands in its place; an ignored one is a compile error. `return value;` and

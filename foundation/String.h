@@ -101,7 +101,8 @@ class TELVANE_EXPORT String {
 static_assert(sizeof(String) == 16);
 
 // Builds many strings in one shared buffer: one allocation for all strings of a decoded batch. The buffer lives until
-// the last slice is gone. REQUIRES: the sum of all appended sizes is at most the capacity given at construction.
+// the last slice is gone. A capacity below the sum of all appended sizes costs an allocation for each text that is too
+// much, and nothing else.
 class TELVANE_EXPORT StringBuffer {
  public:
   // capacity: the number of bytes that will be appended in all.

@@ -10,9 +10,14 @@
 # Who may call. The daemon reads the peer's process, user and groups from the socket and decides with its grants before
 # it answers `open`. What a client says about itself plays no part in that.
 #
-# Bounds. A message of more than 64 MiB, a value nested more than 64 deep, more than a million values in one message, more
-# than 16 unanswered `deliver` calls, or bytes that are none of this end the connection; the other connections go on. So
-# does a peer that leaves its own side unread until more than 16 MiB wait for it.
+# Bounds. Each of these ends the connection, and the other connections go on:
+# - bytes that are none of this, a message of more than 64 MiB, a value nested more than 64 deep, more than 1,048,576
+#   values in one message;
+# - more than 16 messages or 16 KiB from the connecting side before its `open` is answered, and 30 s without `open`;
+# - more than 16 unanswered `deliver` calls;
+# - more than 262,144 calls that wait for an answer of the receiver (a `replyID` not 0, and no `Reply` yet);
+# - more than 64 descriptors in calls that the receiver has not executed yet;
+# - leaving the own side unread until more than 16 MiB wait for it.
 #
 # Failure. When either process ends or closes the socket, every call that has no answer yet has failed. There is no
 # resumption: a new connection is a new session that has been told nothing.
@@ -170,6 +175,13 @@ enum ClientSessionOperation {
 
   setDigestKey @13;
   # digest key :any value, algorithm :integer (signed 32 bits) -> -
+
+  # A number that is not listed has no operation, except for this one, which stands beside the session's own:
+  #
+  # 32, daemonStatus
+  # (no arguments) -> status :dictionary
+  # What the daemon is and holds at the moment, without any event's content: version, process, sessions, storebags,
+  # memory. For people who look after it; the keys stand in interfaces/AgentKeys.h and may become more.
 }
 
 enum ClientSessionReplyOperation {

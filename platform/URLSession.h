@@ -123,9 +123,13 @@ enum class URLErrorCode : int64_t {
   SessionInvalidated = -2000,
 };
 
+// Where URL sessions come from. Made by the entry point, which hands it down and lets go of it after all sessions. Safe
+// from any thread.
 class URLSessionProvider {
  public:
   virtual ~URLSessionProvider() = default;
+  // Returns a new session, never null; nothing goes out before a task of it is resumed. Its delegate is called on the
+  // delegate queue only, and both are kept until the session has become invalid. REQUIRES: neither is null.
   virtual std::unique_ptr<URLSession> newSession(URLSessionConfiguration configuration,
                                                  std::shared_ptr<URLSessionDelegate> delegate,
                                                  std::shared_ptr<SerialQueue> delegateQueue) = 0;

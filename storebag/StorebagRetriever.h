@@ -16,7 +16,13 @@ namespace telvane {
 // defaults, and hands out the section of the device's environment.
 //
 // Made by the entry point as a shared object, one per process; owns the connectivity helper through which all bags are
-// fetched. Safe from any thread; fetching may block its caller for as long as the network takes (15 s per request).
+// fetched. Safe from any thread.
+//
+// A fetch that needs the network blocks its caller until the request has completed, 15 s at most. That holds for the
+// first request of a bag in the life of the process. The helper asks for each URL once and drops a second request
+// without calling its completion; a fetch that stands on that completion never returns, and whatever the caller holds
+// stays held. It comes to that when a bag is fetched again and there is still no file of it: the first answer was none,
+// or no bag of ours, or the file has been removed. Only a new process asks again.
 class StorebagRetriever : public std::enable_shared_from_this<StorebagRetriever> {
  public:
   struct FetchResult {

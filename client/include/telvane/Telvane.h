@@ -30,7 +30,9 @@
 // - A child made by fork starts anew: it may make sessions of its own, while those made before the fork belong to the
 //   parent. In the child they refuse everything, and letting them go there does not end them.
 // - When the process ends, what was sent is still handed to the daemon, for which the end is held up by two seconds at
-//   most; blocks of the caller are not called any more from then on.
+//   most; what the daemon has not taken by then is lost. Blocks of the caller are not called any more from then on.
+// - The library's own lines go to the journal under "libtelvane", error lines unless the user default "clientLogLevel"
+//   asks for more, and nowhere on a machine without a journal.
 namespace telvane {
 
 class ClientSession;
@@ -51,7 +53,14 @@ class TELVANE_EXPORT TelvaneMessageSentDelegate {
 //
 // Made by initWithSessionInfo and owned by whoever holds the pointer. When the last pointer is let go, and everything
 // sent before has been answered, the daemon is told to finish the session and the line is closed; letting go neither
-// waits nor loses what was sent. Safe from any thread.
+// waits nor loses what waits by then. Safe from any thread.
+//
+// What may wait in this process for the daemon is bounded, so that a daemon that does not take events cannot eat the
+// host: 8 MiB of a session's messages, log data and shared data in its own queue and 24 MiB of its calls in its
+// connection, by estimate. Beyond that the newest is dropped, although the call that handed it over has returned true;
+// no completion and no delegate is told of the loss, only an error line, one for each burst, with the number of what was
+// dropped. So a message of more than 24 MiB never goes; one of more than 8 MiB goes only when nothing waits before it
+// and the session has no delegate.
 //
 // Until startConfigurationWithCompletionHandler or fetchReportingStatesWithUserInfo has answered, every category may
 // be sent; from then on the categories that the daemon's configuration filters out do not leave this process. When the
@@ -62,6 +71,9 @@ class TELVANE_EXPORT Telvane : public std::enable_shared_from_this<Telvane> {
   using EnabledBackendsBlock = UniqueFunction<void(const Value& enabledBackendNames)>;
   // Takes nothing on success.
   using ErrorBlock = UniqueFunction<void(const std::optional<Error>& error)>;
+  // Takes whether a backend of the session took what was handed over. That it then arrives at the server is not known
+  // yet: the daemon's log tells. error: absent, also when isSuccess is false; the daemon's log has the reason. Not
+  // called when the daemon cannot be reached, nor for what finds no room (see above).
   using UploadBlock = UniqueFunction<void(bool isSuccess, const std::optional<Error>& error)>;
   // Takes one text that the daemon answered.
   using LoggingBlock = std::function<void(const String& text)>;
@@ -95,13 +107,16 @@ class TELVANE_EXPORT Telvane : public std::enable_shared_from_this<Telvane> {
   // fetchComplete: may be empty; gets an absent value when the daemon cannot be reached.
   void fetchReportingStatesWithUserInfo(const Value& userInfo, EnabledBackendsBlock fetchComplete);
 
-  // Sends one event. payload: a dictionary, may be absent. error: where to put the error, or nothing on success; may be
-  // null. Returns false for category 0 (code 4 of "TelvaneErrorDomain"), else true, also for a category that is
-  // filtered out.
+  // Sends one event. payload: a dictionary, may be absent. Of its entries, those that are arrays or dictionaries are
+  // posted for client type 28 only (on internal builds for 7, too); for the others the daemon leaves each of them out,
+  // with an error line in its log. error: where to put the error, or nothing on success; may be null. Returns false for
+  // category 0 (code 4 of "TelvaneErrorDomain"), else true, also for a category that is filtered out and for an event
+  // that finds no room (see above).
   bool sendMessageWithCategory(uint16_t category, uint16_t type, const Value& payload = {},
                                std::optional<Error>* error = nullptr);
   // Sends one message dictionary: "ParametersCategory" and "ParametersType" (of both, the low 16 bits count), perhaps
-  // "ParametersPayload" and "ParametersFlag". Returns true when it was handed on. Returns false with an error when one
+  // "ParametersPayload" (as for sendMessageWithCategory) and "ParametersFlag". Returns true when it was handed on, also
+  // for one that finds no room. Returns false with an error when one
   // of the two is missing (code 7, the text as the domain) or the category is 0 (code 4), and false without one when
   // the category is filtered out.
   bool sendMessageWithDictionary(const Dictionary& message, std::optional<Error>* error = nullptr);
@@ -117,13 +132,17 @@ class TELVANE_EXPORT Telvane : public std::enable_shared_from_this<Telvane> {
   // does this by itself.
   void finishSession();
 
-  // Adds the entries to the data that all sessions of the hierarchy share and that accompanies every event.
+  // Adds the entries to the data that all sessions of the hierarchy share and that accompanies every event; arrays and
+  // dictionaries among them go by the rule for a payload's. A hierarchy has room for 1 MiB of it, by estimate: an
+  // update that would be more is refused as a whole, and what stood there stays. The caller does not hear of that, the
+  // daemon writes an error line, one for each burst.
   void updateSharedDataWithDictionary(const Dictionary& sharedData);
-  // Sets one entry; an absent value removes the key.
+  // Sets one entry, within the same bound; an absent value removes the key.
   void updateSharedDataForKey(const String& key, const Value& value);
   // Gives the daemon the key of the digest that a header of its requests carries: an HMAC of the uncompressed body, by
-  // which a collector that has the key, too, tells them from forged ones. algorithm: 0 for SHA-1; with any other there
-  // is no digest. Returns false for an absent key.
+  // which a collector that has the key, too, tells them from forged ones. digestKey: Data; a value of any other kind (a
+  // text, say) is taken, and there is no digest. algorithm: 0 for SHA-1; with any other there is no digest either.
+  // Returns false for an absent key, else true.
   bool setDigestKey(const Value& digestKey, int32_t algorithm);
 
   // Whether the upload backend is among the cached enabled backends; false until the daemon has answered.
@@ -157,7 +176,8 @@ class TELVANE_EXPORT Telvane : public std::enable_shared_from_this<Telvane> {
   // Registers a module, behind what was called before, and instead of an earlier one of that number. needToUpdate: call
   // it at ticks that are no report; needToReport: call it for reports. serviceBlock: must not hold the session but
   // weakly. What a block throws is caught and written to the log, and the report goes without what it has filled in. It
-  // is not called twice at once, except for a timer whose interval is 0, which does not wait for its blocks.
+  // is not called twice at once, except for a timer whose interval is 0, which does not wait for its blocks. What it
+  // fills in is a payload: arrays and dictionaries are posted for client type 28 only.
   // Returns false for an empty block, else true.
   bool registerPeriodicTaskForModule(uint32_t module, bool needToUpdate, bool needToReport,
                                      PeriodicTaskBlock serviceBlock);
@@ -185,11 +205,14 @@ class TELVANE_EXPORT Telvane : public std::enable_shared_from_this<Telvane> {
   // Replaces that identifier with a new one.
   static void regeneratePersistentIdentifierForDNU(bool respectsDNU);
   // Makes the token (for "HierarchyToken" in a session info) of a new hierarchy, or of a session below the one with the
-  // parent token. Returns nothing when the parent is no dictionary or has no "token".
+  // parent token. Returns nothing when the parent is no dictionary or has no "token". A parent's "token" is taken as it
+  // is, but one of more than 1024 bytes counts as none: the session that is opened with it belongs to no hierarchy.
   static std::optional<Dictionary> newHierarchyTokenFromParentToken(const Value& parentToken = {});
   // Sends one event without a session. sessionInfo and userInfo as for initWithSessionInfo ("EnableFlag" is not looked
-  // at), payload a dictionary, may be absent. Returns false with an error when the session info is absent (code 2), its
-  // client type is not valid (3), or the category is 0 (4).
+  // at), payload as for sendMessageWithCategory. Returns false with an error when the session info is absent (code 2),
+  // its client type is not valid (3), the category is 0 or the payload no dictionary (4); else true. Of all events of
+  // this process that are sent so, 32 MiB may wait for the daemon, by estimate: beyond that the newest is dropped, with
+  // an error line, and true is returned all the same.
   static bool sendOneMessageWithSessionInfo(const Value& sessionInfo, const Value& userInfo, uint16_t category,
                                             uint16_t type, const Value& payload, std::optional<Error>* error = nullptr);
 

@@ -11,14 +11,24 @@
  * - A dictionary or an array that cannot be carried (containers in each other more than 64 deep, or a kind of node that
  *   no property list has) fails the call: it returns null or false, or does nothing.
  * - A null session does nothing: the function returns false, or nothing, and no callback is called.
- * - No call waits for the daemon. Callbacks run later, on threads of the library, one at a time for each session, each
- *   with the context that was given with it; what they are given is borrowed and gone when they return. A null callback
- *   is never called. A callback of one call is called at most once, and not at all when the daemon can no longer
- * answer, unless the function says otherwise. The context must stay usable until then.
- * - Everything may be called from any thread. A process needs no event loop, may fork (a child opens sessions of its
- *   own; those of its parent are dead there), and keeps its own signal handling. The library never prints or exits.
+ * - No call waits for the daemon. Callbacks run later, on threads of the library, each with the context that was given
+ *   with it; what they are given is borrowed and gone when they return. Those of one session may run beside each other:
+ *   the callbacks of its modules (<telvane/TelvaneSession.h>) up to four at a time, and beside any other. A null
+ *   callback is never called. A callback of one call is called at most once, and not at all when the daemon can no
+ *   longer answer, unless the function says otherwise. The context must stay usable until then.
+ * - Everything may be called from any thread, and beside each other, but for TelvaneRelease: it must not run beside
+ *   another call with the same session, nor may one follow it, inside callbacks neither. The session's memory is gone
+ *   then.
+ * - A process needs no event loop, may fork (a child opens sessions of its own; those of its parent are dead there),
+ *   and keeps its own signal handling. The library never prints or exits. Its error lines go
+ *   to the journal under "libtelvane" (the user default "clientLogLevel" asks for more), on a machine without one
+ *   nowhere.
  * - When the process ends, what was sent is still handed to the daemon, for which the end is held up by two seconds at
- *   most; no callback is called any more from then on.
+ *   most; what the daemon has not taken by then is lost. No callback is called any more from then on.
+ * - What may wait in this process for the daemon is bounded: 8 MiB of a session's messages, log data and shared data in
+ *   its own queue and 24 MiB of its calls in its connection, by estimate. Beyond that the newest is dropped, although
+ *   the call that handed it over has returned true; no callback hears of it, only an error line, one for each burst. So
+ *   a message of more than 24 MiB never goes, and one of more than 8 MiB only when nothing waits before it.
  */
 
 #include <plist/plist.h>
@@ -54,7 +64,8 @@ typedef void (*TelvaneAggregationCallback)(plist_t client, double timestamp, uin
                                            plist_t payload, void* context);
 
 /* Lets the session go: once everything sent before has been answered, the daemon is told to finish it. Returns at
- * once, nothing sent before is lost, and callbacks of calls made before may still come. */
+ * once, nothing that waits by then is lost, and callbacks of calls made before may still come. The last call with this
+ * session, on whichever thread. */
 TELVANE_API void TelvaneRelease(TelvaneRef session);
 
 /* Gives the daemon new user info (a dictionary, may be null), asks for the states that follow from it and keeps them.
@@ -68,26 +79,33 @@ TELVANE_API void TelvaneFetchStatesWithUserInfo(TelvaneRef session, plist_t user
 TELVANE_API void TelvaneSetMessageBlock(TelvaneRef session, TelvaneStringCallback callback, void* context);
 
 /* Both return the token of a new hierarchy (parentToken null), or of the level below the parent's, for
- * kTelvaneSessionInfoHierarchyToken; null when the parent is no dictionary or has no token. The result belongs to the
- * caller. */
+ * kTelvaneSessionInfoHierarchyToken; null when the parent is no dictionary or has no token. A parent's token is taken
+ * as it is, but one of more than 1024 bytes counts as none: the session opened with it belongs to no hierarchy. The
+ * result belongs to the caller. */
 TELVANE_API plist_t TelvaneNewHierarchyTokenFromParentToken(plist_t parentToken);
 TELVANE_API plist_t TelvaneCreateHierarchyTokenFromParentToken(plist_t parentToken);
 
 /* Adds the dictionary's entries to the data that the sessions of the hierarchy share and that accompanies each event.
- * Does nothing for anything but a dictionary. */
+ * A hierarchy has room for 1 MiB of it, by estimate: an update that would be more is refused as a whole, and what stood
+ * there stays. The caller does not hear of that; the daemon writes an error line, one for each burst. Does nothing for
+ * anything but a dictionary. */
 TELVANE_API void TelvaneUpdateSharedDataWithDictionary(TelvaneRef session, plist_t sharedData);
 
-/* Sets one entry of it; a null value removes the key. */
+/* Sets one entry of it, within the same bound; a null value removes the key. */
 TELVANE_API void TelvaneUpdateSharedDataForKey(TelvaneRef session, const char* key, plist_t value);
 
-/* Sends one event. payload: a dictionary, may be null. Returns false for category 0 or a payload that cannot be
- * carried, else true, also for an event that the configuration filters out. *error, if error is not null, is set to
- * null or to an error that belongs to the caller, of the domain kTelvaneErrorDomain. */
+/* Sends one event. payload: a dictionary, may be null. Of its entries, those that are arrays or dictionaries are posted
+ * for client type 28 only (on internal builds for 7, too); for the others the daemon leaves each of them out, with an
+ * error line in its log. Returns false for a null session, and for category 0 or a payload that cannot be carried (both
+ * code 4); else true, also for an event that the configuration filters out, and for one that finds no room (above).
+ * *error, if error is not null, is set to null or to an error that belongs to the caller, of the domain
+ * kTelvaneErrorDomain. A null session leaves it as it is: let it be null before the call. */
 TELVANE_API bool TelvaneSendMessageWithError(TelvaneRef session, uint16_t category, uint16_t type, plist_t payload,
                                              TelvaneErrorRef* error);
 
-/* Sends one message dictionary. Returns true when it was handed on; false with an error when the category (code 7) or
- * the type (7) is missing or the category is 0 (4), and false without one when the configuration filters it out. *error
+/* Sends one message dictionary. Returns true when it was handed on, also when it finds no room; false with an error
+ * when the category (code 7) or the type (7) is missing, the category is 0 (4) or the dictionary cannot be carried (4),
+ * and false without one when the configuration filters it out. Anything but a dictionary counts as an empty one. *error
  * as above; its domain is kTelvaneErrorDomain for code 7, too. */
 TELVANE_API bool TelvaneSendMessageWithDictionary(TelvaneRef session, plist_t message, TelvaneErrorRef* error);
 

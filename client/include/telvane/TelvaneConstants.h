@@ -25,7 +25,7 @@ TELVANE_CONSTANT extern const char kTelvaneSessionInfoSessionID[];
 TELVANE_CONSTANT extern const char kTelvaneSessionInfoBatchEvent[];
 /* boolean: report nothing before user info has come */
 TELVANE_CONSTANT extern const char kTelvaneSessionInfoRequireUserInfo[];
-/* dictionary: a hierarchy token */
+/* dictionary: a hierarchy token; one whose identifier has more than 1024 bytes counts as none */
 TELVANE_CONSTANT extern const char kTelvaneSessionInfoHierarchyToken[];
 
 /* A hierarchy token, which ties sessions together. Made by TelvaneNewHierarchyTokenFromParentToken. */
@@ -45,7 +45,8 @@ TELVANE_CONSTANT extern const char kTelvaneUserInfoServiceName[];
 TELVANE_CONSTANT extern const char kTelvaneMessageParametersCategory[];
 /* number, unsigned 16-bit: the event's type; required */
 TELVANE_CONSTANT extern const char kTelvaneMessageParametersType[];
-/* dictionary: the event's fields */
+/* dictionary: the event's fields. Arrays and dictionaries among them are posted for client type 28 only (on internal
+ * builds for 7, too); for the others they are left out. */
 TELVANE_CONSTANT extern const char kTelvaneMessageParametersPayload[];
 /* number: 0 ordinary, 1 real-time, 2 promoting, 3 both, 4 periodic report */
 TELVANE_CONSTANT extern const char kTelvaneMessageParametersFlag[];

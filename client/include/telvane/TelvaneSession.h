@@ -34,7 +34,8 @@ TELVANE_API void TelvaneStartConfiguration(TelvaneRef session, TelvaneBackendsCa
  * before it returns and does not free, or with null when it is only to update its state. A tick of the log timer waits
  * for the callbacks that it has called, at most four at a time, and what was called of the session meanwhile waits for
  * the tick. So a callback should be quick, and must not wait for anything that the session brings; it may call every
- * function of this library. */
+ * function of this library. What it fills in is a payload: arrays and dictionaries are posted for client type 28
+ * only. */
 typedef void (*TelvanePeriodicTaskCallback)(plist_t metrics, void* context);
 
 /* Registers a module, behind what was called before, and instead of an earlier one of that number. needToUpdate: call
