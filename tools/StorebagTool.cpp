@@ -89,12 +89,19 @@ Result<void> StorebagTool::keygen() {
   }
   const Result<crypto::PrivateKey> key = crypto::PrivateKey::generate();
   if (key.has_error()) return key.error();
+  Result<void> written = writeKeys(*key);
+  // Half a pair is of no use, and would refuse the next attempt.
+  if (written.has_error()) static_cast<void>(_files.remove(_privateKeyFile).has_error());
+  return written;
+}
+
+Result<void> StorebagTool::writeKeys(const crypto::PrivateKey& key) {
   // Nobody but its owner may read a signing key.
   const Result<std::unique_ptr<AppendFile>> file = AppendFile::open(_files.resolve(_privateKeyFile));
-  if (file.has_error()) return file.error();
-  const Result<void> written = (*file)->append(key->pem().view());
-  if (written.has_error()) return written.error();
-  return _files.writeAtomically(_publicKeyFile, key->publicKeyDER());
+  if (file.has_error()) return fault(_privateKeyFile + ": " + file.error().description());
+  const Result<void> written = (*file)->append(key.pem().view());
+  if (written.has_error()) return fault(_privateKeyFile + ": " + written.error().description());
+  return _files.writeAtomically(_publicKeyFile, key.publicKeyDER());
 }
 
 Result<void> StorebagTool::sign() {

@@ -4,6 +4,7 @@
 #include <string>
 
 #include "foundation/Error.h"
+#include "platform/Crypto.h"
 #include "platform/FileSystem.h"
 #include "tools/StorebagExplain.h"
 
@@ -22,6 +23,7 @@ class StorebagTool {
 
  private:
   Result<void> keygen();
+  Result<void> writeKeys(const crypto::PrivateKey& key);
   Result<void> sign();
   void tellMistakes(const Data& bag);
   Result<void> verify();

@@ -3,7 +3,9 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
+#include <filesystem>
 #include <fstream>
 #include <sstream>
 
@@ -95,6 +97,16 @@ TEST_F(StorebagToolTest, keepsTheSigningKeyFromOthersAndDoesNotReplaceIt) {
   EXPECT_EQ(keygen("mine"), 1);
   expectOneErrorLine("exists already");
   EXPECT_EQ(_scratch.read("mine.pem"), key);
+}
+
+TEST_F(StorebagToolTest, keepsNoPrivateKeyWhosePublicOneCannotBeWritten) {
+  const std::vector<std::string> intoAFolderThatIsNotThere{"keygen", "--private-key", "@mine.pem", "--public-key",
+                                                           "@bundle/publicKey.der"};
+  EXPECT_EQ(run(intoAFolderThatIsNotThere), 1);
+  expectOneErrorLine("bundle/publicKey.der");
+  EXPECT_NE(access(_scratch.at("mine.pem").c_str(), F_OK), 0) << "the next attempt would be refused";
+  std::filesystem::create_directory(_scratch.at("bundle"));
+  EXPECT_EQ(run(intoAFolderThatIsNotThere), 0) << _errors.str();
 }
 
 TEST_F(StorebagToolTest, signsNoBagThatNoDeviceWouldTake) {

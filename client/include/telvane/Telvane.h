@@ -58,9 +58,9 @@ class TELVANE_EXPORT TelvaneMessageSentDelegate {
 // What may wait in this process for the daemon is bounded, so that a daemon that does not take events cannot eat the
 // host: 8 MiB of a session's messages, log data and shared data in its own queue and 24 MiB of its calls in its
 // connection, by estimate. Beyond that the newest is dropped, although the call that handed it over has returned true;
-// no completion and no delegate is told of the loss, only an error line, one for each burst, with the number of what was
-// dropped. So a message of more than 24 MiB never goes; one of more than 8 MiB goes only when nothing waits before it
-// and the session has no delegate.
+// no completion and no delegate is told of the loss, only an error line, one for each burst, with the number of what
+// was dropped. So a message of more than 24 MiB never goes; one of more than 8 MiB goes only when nothing waits before
+// it and the session has no delegate.
 //
 // Until startConfigurationWithCompletionHandler or fetchReportingStatesWithUserInfo has answered, every category may
 // be sent; from then on the categories that the daemon's configuration filters out do not leave this process. When the
