@@ -34,7 +34,7 @@ struct ConnectivityShared {
 // Owns one URL session and everything around its lifetime: the mode that configures it, its owner's usage count, the
 // release timer, and the number of sessions served, which it gives back as released transactions.
 //
-// Made through create(), shared by its owner and the backends that post through it; its URL session holds it until
+// Made by initWithDelegate, shared by its owner and the backends that post through it; its URL session holds it until
 // that has become invalid. Safe from any thread: all state is confined to _stateQueue, completions are called there.
 // Created (inactive) -> activate -> active -> invalidate -> inactive. A POST on an inactive helper is dropped silently,
 // a GET completes with the error "ConnectivityHelper is not ative" (so spelled).
@@ -149,8 +149,8 @@ class ReportingSessionConnectivityHelper : public ReportingSessionConnectivityIn
   uint32_t _releaseTimeout GUARDED_BY(*_stateQueue) = kDefaultReleaseTimeout;
   std::shared_ptr<ReleaseTimer> _connectivityHelperReleaseTimer GUARDED_BY(*_stateQueue);
 
-  // Guarded by _shared.admissionLock: every URL ever asked for, true while its pull runs.
-  std::map<std::string, bool> _requestInProgress;
+  // Every URL ever asked for, true while its pull runs.
+  std::map<std::string, bool> _requestInProgress GUARDED_BY(_shared.admissionLock);
 
   // Changed on _stateQueue only, read by owners' blocks on their queues.
   std::atomic<uint32_t> _usageCount{0};

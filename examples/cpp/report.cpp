@@ -59,7 +59,6 @@ bool send(Telvane& session, int number) {
   payload.set("quality", 0.25 * number);
   payload.set("codec", "opus");
   payload.set("muted", number % 2 == 1);
-  payload.set("layers", Array{1, 2, 3});
   std::optional<Error> error;
   const bool isSent = session.sendMessageWithCategory(12, 2, payload, &error);
   if (error) std::cout << "event " << number << " was refused: " << error->description() << "\n";
