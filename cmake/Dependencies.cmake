@@ -11,7 +11,6 @@ find_package(CURL REQUIRED)                                                  # C
 find_package(OpenSSL 3 REQUIRED)                                             # OpenSSL::Crypto, OpenSSL::SSL
 find_package(ZLIB REQUIRED)                                                  # ZLIB::ZLIB
 find_package(fmt REQUIRED)                                                   # fmt::fmt
-find_package(spdlog REQUIRED)                                                # spdlog::spdlog
 pkg_check_modules(LIBPLIST REQUIRED IMPORTED_TARGET libplist-2.0)            # PkgConfig::LIBPLIST
 pkg_check_modules(LIBSYSTEMD REQUIRED IMPORTED_TARGET libsystemd)            # PkgConfig::LIBSYSTEMD
 pkg_check_modules(RAPIDJSON REQUIRED IMPORTED_TARGET RapidJSON)              # PkgConfig::RAPIDJSON
@@ -21,4 +20,6 @@ if(BUILD_TESTING)
   find_package(GTest REQUIRED)                                               # GTest::gmock_main
   include(GoogleTest)
 endif()
-find_package(benchmark QUIET)                                                # benchmark::benchmark
+if(TELVANE_BENCH)
+  find_package(benchmark REQUIRED)                                           # benchmark::benchmark
+endif()

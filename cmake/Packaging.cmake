@@ -10,10 +10,11 @@ set(CPACK_STRIP_FILES ON)
 set(CPACK_DEBIAN_FILE_NAME DEB-DEFAULT)
 set(CPACK_DEBIAN_PACKAGE_SECTION net)
 set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS ON)
-# The public C header speaks libplist's type, so who compiles against it needs that header too.
-set(CPACK_DEBIAN_PACKAGE_DEPENDS "ca-certificates, systemd")
-set(CPACK_DEBIAN_PACKAGE_SUGGESTS "libplist-dev")
-set(CPACK_DEBIAN_PACKAGE_CONTROL_EXTRA
-    "${PROJECT_SOURCE_DIR}/packaging/postinst;${PROJECT_SOURCE_DIR}/packaging/prerm")
+set(CPACK_DEBIAN_PACKAGE_DEPENDS "ca-certificates, init-system-helpers, systemd")
+# The public headers include these: the one for C speaks libplist's type, that for C++ is made with Boost.
+set(CPACK_DEBIAN_PACKAGE_SUGGESTS "libplist-dev, libboost1.81-dev | libboost-dev (>= 1.81)")
+set(telvane_control_scripts postinst prerm postrm)
+list(TRANSFORM telvane_control_scripts PREPEND "${PROJECT_SOURCE_DIR}/packaging/")
+set(CPACK_DEBIAN_PACKAGE_CONTROL_EXTRA "${telvane_control_scripts}")
 set(CPACK_DEBIAN_PACKAGE_CONTROL_STRICT_PERMISSION ON)
 include(CPack)
