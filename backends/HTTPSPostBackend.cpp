@@ -12,7 +12,8 @@ namespace {
 // The defaults keep what anybody stored there; the collector gets text.
 String identifierForDNU(const Platform& platform, bool respectsDNU) {
   const Value identifier =
-      getPersistentIdentifierForDNU(platform.userDefaults, platform.random, platform.log, respectsDNU);
+      getPersistentIdentifierForDNU(platform.userDefaults, platform.random, platform.log,
+                                    {kTelvaneDefaultsSuite, defaultsKeyOfIdentifierForDNU(respectsDNU)});
   return identifier.isString() ? *identifier.string() : String(description(identifier));
 }
 

@@ -3,9 +3,10 @@
 #include <cmath>
 
 #include "backends/HTTPSPostBackend.h"
-#include "backends/MessageFlags.h"
 #include "foundation/ShortDescription.h"
 #include "interfaces/EventKeys.h"
+#include "interfaces/MessageFlags.h"
+#include "interfaces/SessionEvents.h"
 #include "interfaces/SessionKeys.h"
 #include "interfaces/TelvaneErrors.h"
 #include "platform/JSON.h"
@@ -15,8 +16,6 @@
 namespace telvane {
 namespace {
 
-constexpr uint16_t kSessionMethod = 0;
-constexpr uint16_t kSessionStop = 1;
 // Room for what an event gets beside its payload and the user info.
 constexpr size_t kOwnEntries = 24;
 constexpr int64_t kSecondsPerMinute = 60;

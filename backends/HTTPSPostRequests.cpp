@@ -2,9 +2,9 @@
 #include <algorithm>
 
 #include "backends/HTTPSPostBackend.h"
-#include "backends/MessageFlags.h"
 #include "backends/SecuredURL.h"
 #include "interfaces/ClientTypes.h"
+#include "interfaces/MessageFlags.h"
 #include "interfaces/SessionKeys.h"
 #include "interfaces/TelvaneErrors.h"
 #include "platform/Crypto.h"

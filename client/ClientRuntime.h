@@ -7,6 +7,7 @@
 #include "client/ClientContext.h"
 #include "client/ClientSession.h"
 #include "client/OneShotSender.h"
+#include "interfaces/DefaultsKeys.h"
 #include "platform/process/LibraryPlatform.h"
 
 namespace telvane {
@@ -42,7 +43,7 @@ class ClientRuntime {
   static void willExit();
   void finishPendingWork();
 
-  LibraryPlatform _platform;
+  LibraryPlatform _platform{kTelvaneDefaultsSuite};
   ClientContext _context;
   OneShotSender _oneShotSender;
 

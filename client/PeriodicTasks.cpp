@@ -3,13 +3,13 @@
 #include <atomic>
 #include <utility>
 
+#include "interfaces/MessageFlags.h"
 #include "interfaces/SessionKeys.h"
 
 namespace telvane {
 namespace {
 
 constexpr uint64_t kNanosecondsPerSecond = 1'000'000'000;
-constexpr int32_t kRealTimeFlag = 1;
 
 }  // namespace
 
@@ -165,7 +165,7 @@ void PeriodicTasks::send(Dictionary payload, uint16_t category, uint16_t type) {
   log().message("_myPeriodicTask: Sent realtime event after collection all RT metrics");
   Dictionary message;
   message.reserve(4);
-  message.set(kTelvaneMessageParametersFlag, kRealTimeFlag);
+  message.set(kTelvaneMessageParametersFlag, kRealtimeFlag);
   message.set(kTelvaneMessageParametersCategory, category);
   message.set(kTelvaneMessageParametersType, type);
   message.set(kTelvaneMessageParametersPayload, std::move(payload));

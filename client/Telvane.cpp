@@ -5,6 +5,7 @@
 #include "client/Guarded.h"
 #include "client/HierarchyToken.h"
 #include "client/TelvaneFactory.h"
+#include "interfaces/DefaultsKeys.h"
 #include "interfaces/TelvaneErrors.h"
 #include "platform/identifiers/PersistentIdentifiers.h"
 
@@ -210,14 +211,16 @@ void Telvane::stopLogTimer() {
 Value Telvane::getPersistentIdentifierForDNU(bool respectsDNU) {
   return guarded(Value(), [&] {
     const ClientPlatform& platform = ClientRuntime::current().platform();
-    return telvane::getPersistentIdentifierForDNU(platform.userDefaults, platform.random, platform.log, respectsDNU);
+    return telvane::getPersistentIdentifierForDNU(platform.userDefaults, platform.random, platform.log,
+                                                  {kTelvaneDefaultsSuite, defaultsKeyOfIdentifierForDNU(respectsDNU)});
   });
 }
 
 void Telvane::regeneratePersistentIdentifierForDNU(bool respectsDNU) {
   guarded([&] {
     const ClientPlatform& platform = ClientRuntime::current().platform();
-    telvane::regeneratePersistentIdentifierForDNU(platform.userDefaults, platform.random, platform.log, respectsDNU);
+    telvane::regeneratePersistentIdentifierForDNU(platform.userDefaults, platform.random, platform.log,
+                                                  {kTelvaneDefaultsSuite, defaultsKeyOfIdentifierForDNU(respectsDNU)});
   });
 }
 

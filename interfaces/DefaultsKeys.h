@@ -13,6 +13,11 @@ inline constexpr Key kDefaultsHTTPSRealtimePostURL{"httpsRealtimePostURL"};
 inline constexpr Key kDefaultsForceEventLogging{"forceEventLogging"};
 inline constexpr Key kDefaultsUUIDRespectDNU{"uuidRespectDNU"};
 inline constexpr Key kDefaultsUUIDOverrideDNU{"uuidOverrideDNU"};
+// Which of the device's two identifiers: the one that respects the user's wish not to be followed, or the one that
+// overrides it.
+constexpr Key defaultsKeyOfIdentifierForDNU(bool respectsDNU) noexcept {
+  return respectsDNU ? kDefaultsUUIDRespectDNU : kDefaultsUUIDOverrideDNU;
+}
 
 inline constexpr Key kTimedDefaultsSuite{"com.corvex.timed"};
 inline constexpr Key kDefaultsAutomaticTimeZoneEnabled{"TMAutomaticTimeZoneEnabled"};

@@ -5,16 +5,11 @@
 
 #include "foundation/Base64.h"
 #include "interfaces/EventKeys.h"
+#include "interfaces/SessionEvents.h"
 #include "interfaces/SessionKeys.h"
 #include "util/DataHelpers.h"
 
 namespace telvane {
-namespace {
-
-constexpr uint16_t kSessionMethod = 0;
-constexpr uint16_t kSessionStop = 1;
-
-}  // namespace
 
 std::shared_ptr<TelvanedSession> TelvanedSession::initWithSessionDelegate(
     const ProcessContext& context, SessionShared& shared, std::shared_ptr<TelvanedSessionDelegate> delegate,

@@ -5,15 +5,13 @@
 #include "interfaces/BackendNames.h"
 #include "interfaces/DefaultsKeys.h"
 #include "interfaces/EventKeys.h"
+#include "interfaces/SessionEvents.h"
 #include "interfaces/SessionKeys.h"
 #include "interfaces/StorebagKeys.h"
 
 namespace telvane {
 namespace {
 
-constexpr uint16_t kSessionMethod = 0;
-constexpr uint16_t kSessionStart = 0;
-constexpr std::string_view kUnknown = "Unknown";
 constexpr size_t kMaximumHierarchyTokenBytes = 1024;
 
 Value orUnknown(std::optional<String> answer) {

@@ -2,13 +2,12 @@
 #include "daemon/session/TelvanedSession.h"
 #include "interfaces/ClientTypes.h"
 #include "interfaces/HealthKeys.h"
+#include "interfaces/SessionEvents.h"
 #include "interfaces/SessionKeys.h"
 #include "util/DataHelpers.h"
 
 namespace telvane {
 namespace {
-
-constexpr std::string_view kUnknown = "Unknown";
 
 std::string_view shortNameOf(const Value& sessionInfo) {
   const Dictionary* dictionary = sessionInfo.dictionary();

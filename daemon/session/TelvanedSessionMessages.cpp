@@ -2,6 +2,7 @@
 #include "daemon/session/TelvanedSession.h"
 #include "interfaces/BackendNames.h"
 #include "interfaces/FileURL.h"
+#include "interfaces/MessageFlags.h"
 #include "interfaces/SessionKeys.h"
 #include "interfaces/TelvaneErrors.h"
 
@@ -115,7 +116,7 @@ Dictionary TelvanedSession::messageBlob(Value payload) {
 void TelvanedSession::internalSendMessage(const Value& payload, uint16_t method, uint16_t respCode) {
   Dictionary message{{kTelvaneMessageParametersCategory, method}, {kTelvaneMessageParametersType, respCode}};
   message.set(kTelvaneMessageParametersPayload, payload);
-  message.set(kTelvaneMessageParametersFlag, Value(0));
+  message.set(kTelvaneMessageParametersFlag, Value(kOrdinaryFlag));
   sendMessageToBackends(std::move(message));
   log().message("internalSendMessage: Sent internal message (method:{} respCode:{})", method, respCode);
 }

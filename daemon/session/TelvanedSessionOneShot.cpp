@@ -1,14 +1,11 @@
 // Messages that are sent without a configured session.
 #include "daemon/session/TelvanedSession.h"
 #include "interfaces/EventKeys.h"
+#include "interfaces/MessageFlags.h"
+#include "interfaces/SessionEvents.h"
 #include "interfaces/SessionKeys.h"
 
 namespace telvane {
-namespace {
-
-constexpr std::string_view kUnknown = "Unknown";
-
-}  // namespace
 
 void TelvanedSession::sendMessageWithSessionInfo(Dictionary sessionInfo, Value userInfo, uint16_t category,
                                                  uint16_t type, Dictionary payload,
@@ -67,13 +64,12 @@ void TelvanedSession::sendOneMessageWithSessionInfo(const Dictionary& sessionInf
 
 void TelvanedSession::sendOneMessageToBackend(TelvaneBackend& backend, Date timestamp, uint16_t category, uint16_t type,
                                               const Dictionary& payload) {
-  constexpr uint32_t kOrdinary = 0;
   Dictionary message = payload;
   if (_context.isInternalBuild()) {
     const auto serialNumber = _context.platform().deviceAnswers.answer(DeviceAnswers::kSerialNumber);
     message.set(kEventSerialNum, serialNumber.has_value() ? Value(*serialNumber) : Value(kUnknown));
   }
-  const std::optional<String> result = backend.sendMessage(message, timestamp, category, type, kOrdinary);
+  const std::optional<String> result = backend.sendMessage(message, timestamp, category, type, kOrdinaryFlag);
   if (!result.has_value()) return;
   _shared.messageLog.writeToLogFile("[{} -> sendOneMessageWithSessionInfo] {}", backend.name(), *result);
 }

@@ -10,14 +10,18 @@
 // them, each from its own user's defaults. Safe from any thread and any process: reading and making are one step.
 namespace telvane {
 
-// Which of the two: the one that respects the user's wish not to be followed, or the one that overrides it.
-Key persistentIdentifierKeyForDNU(bool respectsDNU) noexcept;
+// Where one of the two is kept.
+struct IdentifierPlace {
+  Key suite;
+  Key key;
+};
 
 // Returns the stored identifier, whatever its type; only when there is none makes a UUID text (36 characters,
 // upper-case) and stores it.
-Value getPersistentIdentifierForDNU(UserDefaults& userDefaults, Random& random, Log& log, bool respectsDNU);
+Value getPersistentIdentifierForDNU(UserDefaults& userDefaults, Random& random, Log& log, const IdentifierPlace& place);
 
 // Replaces the stored identifier with a new UUID text. A failed write is logged; the old one then stays.
-void regeneratePersistentIdentifierForDNU(UserDefaults& userDefaults, Random& random, Log& log, bool respectsDNU);
+void regeneratePersistentIdentifierForDNU(UserDefaults& userDefaults, Random& random, Log& log,
+                                          const IdentifierPlace& place);
 
 }  // namespace telvane

@@ -15,12 +15,11 @@
 namespace telvane {
 namespace {
 
-constexpr Key kSuite{"com.corvex.telvane"};
 constexpr Key kLogLevel{"clientLogLevel"};
 
-std::unique_ptr<Log> newLibraryLog(const Paths& paths) {
+std::unique_ptr<Log> newLibraryLog(const Paths& paths, Key defaultsSuite) {
   NullLog silence;
-  const int64_t level = PropertyListUserDefaults(paths, silence).objectForKey(kSuite, kLogLevel).integerValue();
+  const int64_t level = PropertyListUserDefaults(paths, silence).objectForKey(defaultsSuite, kLogLevel).integerValue();
   const LogLevel leastImportant = level >= 2 ? LogLevel::Info : level == 1 ? LogLevel::Default : LogLevel::Error;
   return newLog(LogTarget::JournalOrNothing, leastImportant, "libtelvane");
 }
@@ -29,8 +28,8 @@ std::unique_ptr<Log> newLibraryLog(const Paths& paths) {
 
 // In the order in which they need each other.
 struct LibraryPlatform::Parts {
-  explicit Parts(const Paths& paths)
-      : log(newLibraryLog(paths)),
+  Parts(const Paths& paths, Key defaultsSuite)
+      : log(newLibraryLog(paths, defaultsSuite)),
         files(paths),
         userDefaults(paths, *log),
         entitlements(files, *log),
@@ -46,7 +45,8 @@ struct LibraryPlatform::Parts {
   ipc::SocketService localService;
 };
 
-LibraryPlatform::LibraryPlatform() : _parts(std::make_unique<Parts>(Paths::fromEnvironment(Environment::read()))) {}
+LibraryPlatform::LibraryPlatform(Key defaultsSuite)
+    : _parts(std::make_unique<Parts>(Paths::fromEnvironment(Environment::read()), defaultsSuite)) {}
 
 LibraryPlatform::~LibraryPlatform() = default;
 

@@ -5,8 +5,8 @@
 
 #include <set>
 
-#include "backends/MessageFlags.h"
 #include "interfaces/EventKeys.h"
+#include "interfaces/MessageFlags.h"
 #include "interfaces/StorebagKeys.h"
 #include "tests/backends/BackendFixture.h"
 #include "tests/backends/ProtocolPage.h"

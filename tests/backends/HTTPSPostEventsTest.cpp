@@ -2,9 +2,9 @@
 #include <cmath>
 #include <limits>
 
-#include "backends/MessageFlags.h"
 #include "interfaces/DefaultsKeys.h"
 #include "interfaces/EventKeys.h"
+#include "interfaces/MessageFlags.h"
 #include "interfaces/SessionKeys.h"
 #include "interfaces/StorebagKeys.h"
 #include "platform/JSON.h"

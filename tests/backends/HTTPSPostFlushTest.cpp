@@ -1,6 +1,6 @@
 // How events wait, and how they go.
-#include "backends/MessageFlags.h"
 #include "interfaces/EventKeys.h"
+#include "interfaces/MessageFlags.h"
 #include "interfaces/SessionKeys.h"
 #include "interfaces/StorebagKeys.h"
 #include "interfaces/TelvaneErrors.h"

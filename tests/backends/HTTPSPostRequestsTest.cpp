@@ -1,6 +1,6 @@
 // The request, byte by byte.
-#include "backends/MessageFlags.h"
 #include "interfaces/EventKeys.h"
+#include "interfaces/MessageFlags.h"
 #include "interfaces/SessionKeys.h"
 #include "interfaces/StorebagKeys.h"
 #include "platform/Compression.h"

@@ -14,7 +14,10 @@ namespace {
 
 class PersistentIdentifiersTest : public ::testing::Test {
  protected:
-  Value get(bool respectsDNU) { return getPersistentIdentifierForDNU(_defaults, _random, _log, respectsDNU); }
+  static IdentifierPlace place(bool respectsDNU) {
+    return {kTelvaneDefaultsSuite, defaultsKeyOfIdentifierForDNU(respectsDNU)};
+  }
+  Value get(bool respectsDNU) { return getPersistentIdentifierForDNU(_defaults, _random, _log, place(respectsDNU)); }
   Value stored(const Key& key) { return _defaults.objectForKey(kTelvaneDefaultsSuite, key); }
 
   RecordingLog _log;
@@ -49,7 +52,7 @@ TEST_F(PersistentIdentifiersTest, returnsWhateverIsStored) {
 TEST_F(PersistentIdentifiersTest, regeneratesOnlyTheOneAskedFor) {
   const Value respecting = get(true);
   const Value overriding = get(false);
-  regeneratePersistentIdentifierForDNU(_defaults, _random, _log, true);
+  regeneratePersistentIdentifierForDNU(_defaults, _random, _log, place(true));
   const Value renewed = get(true);
   EXPECT_NE(renewed, respecting);
   EXPECT_EQ(get(false), overriding);
