@@ -6,12 +6,16 @@
 #include "client/ValueSize.h"
 #include "interfaces/BackendNames.h"
 #include "interfaces/FileURL.h"
+#include "interfaces/MessageFlags.h"
 #include "interfaces/SessionKeys.h"
 #include "interfaces/TelvaneErrors.h"
 #include "platform/process/FileExtension.h"
 
 namespace telvane {
 namespace {
+
+// What a waiting file counts in the reporting queue, so that at most 64 descriptors of the host wait there.
+constexpr uint64_t kBytesOfADescriptor = ReportingQueue::kMaximumWaitingBytes / 64;
 
 bool isDisabled(const Dictionary& sessionInfo) {
   return sessionInfo.contains(kTelvaneSessionInfoEnableFlag) &&
@@ -226,7 +230,7 @@ bool ClientSession::sendMessageWithCategory(uint16_t category, uint16_t type, co
   message.set(kTelvaneMessageParametersCategory, category);
   message.set(kTelvaneMessageParametersType, type);
   message.set(kTelvaneMessageParametersPayload, payload);
-  message.set(kTelvaneMessageParametersFlag, 0);
+  message.set(kTelvaneMessageParametersFlag, kOrdinaryFlag);
   // A filtered message is a success here: the caller of this form does not care what the configuration leaves out.
   sendMessageWithDictionary(message, error);
   return true;
@@ -320,15 +324,19 @@ void ClientSession::didFlush(const Value& result, const std::optional<Error>& er
 void ClientSession::finishSession() { oneWayProxy("finishSession").finishSessionGracefully(); }
 
 void ClientSession::updateSharedDataWithDictionary(Dictionary sharedData) {
-  _reportingQueue->perform([self = shared_from_this(), sharedData = std::move(sharedData)] {
+  const uint64_t bytes = estimatedSize(sharedData);
+  auto step = [self = shared_from_this(), sharedData = std::move(sharedData)] {
     self->oneWayProxy("updateSharedDataWithDictionary").updateSharedDataWithDictionary(sharedData);
-  });
+  };
+  _reportingQueue->performCall(std::move(step), bytes);
 }
 
 void ClientSession::updateSharedDataForKey(String key, Value value) {
-  _reportingQueue->perform([self = shared_from_this(), key = std::move(key), value = std::move(value)] {
+  const uint64_t bytes = key.size() + estimatedSize(value);
+  auto step = [self = shared_from_this(), key = std::move(key), value = std::move(value)] {
     self->oneWayProxy("updateSharedDataForKey").updateSharedDataForKey(key, value);
-  });
+  };
+  _reportingQueue->performCall(std::move(step), bytes);
 }
 
 bool ClientSession::setDigestKey(Value digestKey, int32_t algorithm) {
@@ -336,10 +344,12 @@ bool ClientSession::setDigestKey(Value digestKey, int32_t algorithm) {
     log().error("setDigestKey: digestKey should not be nil!!!");
     return false;
   }
-  _reportingQueue->perform([self = shared_from_this(), digestKey = std::move(digestKey), algorithm] {
+  const uint64_t bytes = estimatedSize(digestKey);
+  auto step = [self = shared_from_this(), digestKey = std::move(digestKey), algorithm] {
     // The key goes under the name of the upload in the log; readers of logs know it so.
     self->oneWayProxy("uploadDataArray").setDigestKey(digestKey, algorithm);
-  });
+  };
+  _reportingQueue->performCall(std::move(step), bytes);
   return true;
 }
 
@@ -374,7 +384,7 @@ bool ClientSession::uploadFileWithURL(const String& fileURL, Telvane::UploadBloc
                               self->_context.callOut("uploadFileWithURL", [&] { completion(isSuccess, std::nullopt); });
                           });
   };
-  _reportingQueue->perform(std::move(step));
+  _reportingQueue->performCall(std::move(step), kBytesOfADescriptor);
   return true;
 }
 
@@ -383,6 +393,7 @@ bool ClientSession::uploadDataArray(Array logData, Telvane::UploadBlock completi
     log().error("uploadDataArray: Log data array is empty");
     return false;
   }
+  const uint64_t bytes = estimatedSize(logData);
   auto step = [self = shared_from_this(), logData = std::move(logData),
                completion = std::move(completionHandler)]() mutable {
     auto reply = [self, completion = std::move(completion)](bool isSuccess, const std::optional<Error>& error) mutable {
@@ -390,7 +401,7 @@ bool ClientSession::uploadDataArray(Array logData, Telvane::UploadBlock completi
     };
     self->proxy("uploadDataArray").uploadLogData(std::move(logData), std::move(reply));
   };
-  _reportingQueue->perform(std::move(step));
+  _reportingQueue->performCall(std::move(step), bytes);
   return true;
 }
 

@@ -18,12 +18,12 @@ void ReportingQueue::async(Job step) {
   if (mustSchedule) scheduleRun();
 }
 
-void ReportingQueue::asyncBounded(Job step, uint64_t bytes, uint64_t ReportingQueue::*dropped) {
+void ReportingQueue::asyncBounded(Job step, uint64_t bytes, uint64_t Dropped::*kind) {
   bool mustSchedule = false;
   {
     MutexLock lock(_mutex);
     if (_bytes + bytes > kMaximumWaitingBytes) {
-      ++(this->*dropped);
+      ++(_dropped.*kind);
       return;
     }
     _bytes += bytes;
@@ -75,29 +75,31 @@ void ReportingQueue::run() {
 
 std::vector<Job> ReportingQueue::takeWaiting() {
   std::vector<Job> steps;
-  uint64_t droppedMessages = 0;
-  uint64_t droppedNotices = 0;
+  Dropped dropped;
   {
     MutexLock lock(_mutex);
     steps.swap(_waiting);
     _bytes -= _runningBytes;
     _runningBytes = _bytes;
-    droppedMessages = std::exchange(_droppedMessages, 0);
-    droppedNotices = std::exchange(_droppedNotices, 0);
+    dropped = std::exchange(_dropped, {});
     if (steps.empty()) _isBusy = false;
   }
-  logDropped(droppedMessages, droppedNotices);
+  logDropped(dropped);
   return steps;
 }
 
-void ReportingQueue::logDropped(uint64_t messages, uint64_t notices) {
-  if (messages > 0) {
-    _log.error("Dropped {} events: more than {} bytes were waiting to be handed to the daemon", messages,
+void ReportingQueue::logDropped(const Dropped& dropped) {
+  if (dropped.messages > 0) {
+    _log.error("Dropped {} events: more than {} bytes were waiting to be handed to the daemon", dropped.messages,
                kMaximumWaitingBytes);
   }
-  if (notices > 0) {
+  if (dropped.notices > 0) {
     _log.error("Dropped {} notices of filtered events: more than {} bytes were waiting to be handed to the delegate",
-               notices, kMaximumWaitingBytes);
+               dropped.notices, kMaximumWaitingBytes);
+  }
+  if (dropped.calls > 0) {
+    _log.error("Dropped {} calls: more than {} bytes were waiting to be handed to the daemon", dropped.calls,
+               kMaximumWaitingBytes);
   }
 }
 

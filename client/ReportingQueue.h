@@ -17,9 +17,9 @@ namespace telvane {
 //
 // Shared by its session; the job that runs waiting steps keeps it alive. Safe from any thread.
 //
-// Waiting messages are bounded by bytes: what is behind a step that does not end must not eat the host process. Beyond
-// the bound the newest is dropped, with one error line per burst. A message counts until the steps that it is run with
-// are done.
+// Waiting messages, and calls that carry the host's data, are bounded by bytes: what is behind a step that does not end
+// must not eat the host process. Beyond the bound the newest is dropped, with one error line per burst. A message
+// counts until the steps that it is run with are done. Steps without such data are not counted.
 class ReportingQueue : public std::enable_shared_from_this<ReportingQueue> {
  public:
   // A quarter of what a session's events may take while they wait for the daemon; the rest is the connection's.
@@ -57,18 +57,28 @@ class ReportingQueue : public std::enable_shared_from_this<ReportingQueue> {
   // Runs the step on the serial queue, behind everything given before.
   void async(Job step);
   // The same for a step that holds a message of about this many bytes. Drops it beyond the bound.
-  void asyncMessage(Job step, uint64_t bytes) {
-    asyncBounded(std::move(step), bytes, &ReportingQueue::_droppedMessages);
-  }
+  void asyncMessage(Job step, uint64_t bytes) { asyncBounded(std::move(step), bytes, &Dropped::messages); }
   // The same for a step that only tells of a message that goes nowhere: when dropped, it does not count as an event.
-  void asyncNotice(Job step, uint64_t bytes) { asyncBounded(std::move(step), bytes, &ReportingQueue::_droppedNotices); }
+  void asyncNotice(Job step, uint64_t bytes) { asyncBounded(std::move(step), bytes, &Dropped::notices); }
+  // The same as perform for a step that holds about this many bytes of the host's, but no message. Drops it when it
+  // would have to wait beyond the bound. REQUIRES: as for tryPerform.
+  template <class Step>
+  void performCall(Step step, uint64_t bytes) {
+    if (!tryPerform(step)) asyncBounded(std::move(step), bytes, &Dropped::calls);
+  }
 
  private:
   struct End {
     ReportingQueue& queue;
     ~End() { queue.end(); }
   };
-  void asyncBounded(Job step, uint64_t bytes, uint64_t ReportingQueue::*dropped) EXCLUDES(_mutex);
+  // How much was dropped since that was last logged.
+  struct Dropped {
+    uint64_t messages = 0;
+    uint64_t notices = 0;
+    uint64_t calls = 0;
+  };
+  void asyncBounded(Job step, uint64_t bytes, uint64_t Dropped::*kind) EXCLUDES(_mutex);
   bool begin() EXCLUDES(_mutex);
   void end() EXCLUDES(_mutex);
   // Makes the caller the one who sees to the steps; false when somebody is already.
@@ -77,7 +87,7 @@ class ReportingQueue : public std::enable_shared_from_this<ReportingQueue> {
   // Runs what waits until nothing does, with a break now and then.
   void run();
   std::vector<Job> takeWaiting();
-  void logDropped(uint64_t messages, uint64_t notices);
+  void logDropped(const Dropped& dropped);
 
   // Constant after construction.
   const std::shared_ptr<SerialQueue> _queue;
@@ -89,8 +99,7 @@ class ReportingQueue : public std::enable_shared_from_this<ReportingQueue> {
   std::vector<Job> _waiting GUARDED_BY(_mutex);
   uint64_t _bytes GUARDED_BY(_mutex) = 0;         // of the messages that wait and of those being run
   uint64_t _runningBytes GUARDED_BY(_mutex) = 0;  // of those being run
-  uint64_t _droppedMessages GUARDED_BY(_mutex) = 0;
-  uint64_t _droppedNotices GUARDED_BY(_mutex) = 0;
+  Dropped _dropped GUARDED_BY(_mutex);
 };
 
 }  // namespace telvane

@@ -7,6 +7,7 @@ namespace {
 constexpr int kMaximumDepth = 64;
 
 uint64_t sizeOf(const Value& value, int depth) noexcept;
+uint64_t sizeOf(const Array& array, int depth) noexcept;
 
 uint64_t sizeOf(const Dictionary& dictionary, int depth) noexcept {
   uint64_t size = sizeof(Dictionary);
@@ -22,9 +23,13 @@ uint64_t sizeOf(const Value& value, int depth) noexcept {
   if (value.string() != nullptr) return size + value.string()->size();
   if (value.data() != nullptr) return size + value.data()->size();
   if (value.dictionary() != nullptr) return size + sizeOf(*value.dictionary(), depth - 1);
-  if (value.array() != nullptr) {
-    for (const Value& element : *value.array()) size += sizeOf(element, depth - 1);
-  }
+  if (value.array() != nullptr) return size + sizeOf(*value.array(), depth - 1);
+  return size;
+}
+
+uint64_t sizeOf(const Array& array, int depth) noexcept {
+  uint64_t size = 0;
+  for (const Value& element : array) size += sizeOf(element, depth);
   return size;
 }
 
@@ -32,5 +37,6 @@ uint64_t sizeOf(const Value& value, int depth) noexcept {
 
 uint64_t estimatedSize(const Value& value) noexcept { return sizeOf(value, kMaximumDepth); }
 uint64_t estimatedSize(const Dictionary& dictionary) noexcept { return sizeOf(dictionary, kMaximumDepth); }
+uint64_t estimatedSize(const Array& array) noexcept { return sizeOf(array, kMaximumDepth); }
 
 }  // namespace telvane

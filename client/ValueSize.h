@@ -10,5 +10,6 @@ namespace telvane {
 // each time it is met.
 uint64_t estimatedSize(const Value& value) noexcept;
 uint64_t estimatedSize(const Dictionary& dictionary) noexcept;
+uint64_t estimatedSize(const Array& array) noexcept;
 
 }  // namespace telvane

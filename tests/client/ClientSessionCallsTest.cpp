@@ -3,6 +3,7 @@
 #include <stdexcept>
 
 #include "client/ClientSession.h"
+#include "client/ReportingQueue.h"
 #include "interfaces/FileURL.h"
 #include "tests/client/ClientFixture.h"
 #include "tests/support/ScratchFolder.h"
@@ -10,10 +11,26 @@
 namespace telvane::testing {
 namespace {
 
+class Listener final : public TelvaneMessageSentDelegate {
+ public:
+  void didSendMessageForReportingClient(const std::shared_ptr<Telvane>&, const Dictionary&) override {}
+};
+
 // Flushes, shared data, digest key and uploads.
 class ClientSessionCallsTest : public ClientFixture {
  protected:
+  // A session whose calls wait until run(), behind a message of which its delegate has not been told yet.
+  std::shared_ptr<Telvane> openHeldUp() {
+    daemon().answer(Operation::SendMessageWithDictionary, Array{Value()});
+    std::shared_ptr<Telvane> session = open();
+    session->setMessageSentDelegate(_listener);
+    run();
+    EXPECT_TRUE(session->sendMessageWithCategory(9, 1));
+    return session;
+  }
+
   ScratchFolder _folder;
+  const std::shared_ptr<Listener> _listener = std::make_shared<Listener>();
 };
 
 TEST_F(ClientSessionCallsTest, flushesAndPassesTheTextOn) {
@@ -89,6 +106,44 @@ TEST_F(ClientSessionCallsTest, forwardsSharedData) {
   EXPECT_EQ(daemon().calls()[2].arguments, (Array{"k", Array{1}}));
   EXPECT_EQ(daemon().calls()[3].arguments[0], Value("k"));
   EXPECT_FALSE(daemon().calls()[3].arguments[1].isPresent()) << "an absent value removes the key";
+}
+
+TEST_F(ClientSessionCallsTest, dropsTheNewestCallsBeyondTheBoundWhileTheyWait) {
+  log().expectError("Dropped 4 calls: more than 8388608 bytes were waiting to be handed to the daemon");
+  daemon().answer(Operation::UploadLogData, Array{true, Value()});
+  const std::string text(ReportingQueue::kMaximumWaitingBytes / 5 * 2, 'x');
+  const auto session = openHeldUp();
+  session->updateSharedDataForKey("a", text);
+  session->updateSharedDataWithDictionary({{Key("b"), text}});
+  session->updateSharedDataForKey("c", text);
+  session->updateSharedDataWithDictionary({{Key("d"), text}});
+  EXPECT_TRUE(session->setDigestKey(Data::copyOf(text), 0)) << "as with events, only the log tells";
+  bool isCalled = false;
+  EXPECT_TRUE(session->uploadDataArray(Array{Dictionary{{kTelvaneLogDataData, text}}},
+                                       [&](bool, const std::optional<Error>&) { isCalled = true; }));
+  run();
+  EXPECT_FALSE(isCalled);
+  EXPECT_EQ(daemon().count(Operation::SendMessageWithDictionary), 1u);
+  EXPECT_EQ(daemon().last(Operation::UpdateSharedDataForKey).arguments[0], Value("a"));
+  EXPECT_EQ(daemon().last(Operation::UpdateSharedDataWithDictionary).arguments, (Array{Dictionary{{Key("b"), text}}}));
+  EXPECT_EQ(daemon().count(Operation::SetDigestKey) + daemon().count(Operation::UploadLogData), 0u);
+  EXPECT_TRUE(session->sendMessageWithCategory(9, 1));
+  EXPECT_TRUE(session->uploadDataArray(Array{Dictionary{{kTelvaneLogDataData, text}}}));
+  session->updateSharedDataForKey("e", text);
+  run();
+  EXPECT_EQ(daemon().count(Operation::UploadLogData), 1u) << "there is room again";
+  EXPECT_EQ(daemon().last(Operation::UpdateSharedDataForKey).arguments[0], Value("e"));
+}
+
+TEST_F(ClientSessionCallsTest, holdsFewFilesOpenWhileTheirUploadsWait) {
+  log().expectError("calls: more than 8388608 bytes were waiting to be handed to the daemon");
+  daemon().answer(Operation::UploadFileAtPath, Array{true});
+  const std::string path = _folder.write("a.log", "the log");
+  const auto session = openHeldUp();
+  for (int i = 0; i < 100; ++i) EXPECT_TRUE(session->uploadFileWithURL(path));
+  run();
+  EXPECT_GT(daemon().count(Operation::UploadFileAtPath), 50u);
+  EXPECT_LE(daemon().count(Operation::UploadFileAtPath), 64u) << "each is a descriptor of the host's";
 }
 
 TEST_F(ClientSessionCallsTest, logsSharedDataThatIsLost) {

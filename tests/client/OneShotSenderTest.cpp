@@ -12,6 +12,27 @@ class OneShotSenderTest : public ClientFixture {
     return _sender.sendOneMessageWithSessionInfo(info, _userInfo, category, 2, payload, error);
   }
 
+  // Sends an event of which two fit, and not three.
+  bool sendLarge(uint16_t category) {
+    return send(sessionInfo(), category, Dictionary{{Key("text"), String(std::string(kLarge, 'x'))}});
+  }
+  // A daemon that takes events and answers when the test says so.
+  void givenASilentDaemon() {
+    daemon().answer(Operation::SendMessageWithSessionInfo,
+                    [this](const ScriptedDaemon::Call&, ipc::ReplyBlock reply) { _kept.push_back(std::move(reply)); });
+  }
+  void answer(size_t index) {
+    std::exchange(_kept[index], {})(Array{"finished"});
+    run();
+  }
+  std::vector<int64_t> categories() {
+    std::vector<int64_t> sent;
+    for (const ScriptedDaemon::Call& call : daemon().calls()) sent.push_back(call.arguments[2].integerValue());
+    return sent;
+  }
+
+  static constexpr size_t kLarge = OneShotSender::kMaximumWaitingBytes / 5 * 2;
+  std::vector<ipc::ReplyBlock> _kept;
   const Dictionary _userInfo{{kTelvaneUserInfoClientName, "app"}};
   OneShotSender _sender{_context};
 };
@@ -140,6 +161,79 @@ TEST_F(OneShotSenderTest, anAnswerThatTakesLongHoldsUpTheOthersForTenSecondsOnly
   for (ipc::ReplyBlock& reply : kept) reply(Array{"finished"});
   run();
   EXPECT_EQ(daemon().endedConnectionCount(), 2u);
+}
+
+TEST_F(OneShotSenderTest, dropsTheNewestBeyondTheBoundUntilTheDaemonHasAnswered) {
+  log().expectError("sendOneMessageWithSessionInfo: Dropping events: more than 33554432 bytes wait for the daemon");
+  log().expectError("sendOneMessageWithSessionInfo: Dropped 3 events");
+  givenASilentDaemon();
+  EXPECT_TRUE(sendLarge(1));
+  EXPECT_TRUE(sendLarge(2));
+  EXPECT_TRUE(sendLarge(3)) << "dropping an event is no error of its caller's";
+  EXPECT_TRUE(hasLines(log(), 1, "Dropping events")) << "told at once: this daemon may never answer";
+  EXPECT_TRUE(sendLarge(4));
+  run();
+  _world.advance(std::chrono::seconds(60));
+  EXPECT_TRUE(sendLarge(5));
+  run();
+  EXPECT_EQ(categories(), (std::vector<int64_t>{1, 2})) << "what is with the daemon still takes its memory";
+  EXPECT_TRUE(hasLines(log(), 1, "Dropping events")) << "one line per burst";
+  answer(0);
+  EXPECT_TRUE(hasLines(log(), 1, "Dropped 3 events"));
+  EXPECT_TRUE(sendLarge(6));
+  run();
+  EXPECT_EQ(categories(), (std::vector<int64_t>{1, 2, 6})) << "there is room again";
+  answer(1);
+  answer(2);
+  EXPECT_EQ(daemon().endedConnectionCount(), 3u);
+  EXPECT_TRUE(hasLines(log(), 2, "Dropp"));
+}
+
+TEST_F(OneShotSenderTest, countsAllThatAnEventHolds) {
+  log().expectError("sendOneMessageWithSessionInfo: Dropping events");
+  log().expectError("sendOneMessageWithSessionInfo: Dropped 1 events");
+  givenASilentDaemon();
+  Dictionary info = sessionInfo();
+  info.set(kTelvaneSessionInfoSessionID, String(std::string(kLarge, 'x')));
+  EXPECT_TRUE(send(info, 1));
+  const Dictionary userInfo{{kTelvaneUserInfoClientName, String(std::string(kLarge, 'x'))}};
+  EXPECT_TRUE(_sender.sendOneMessageWithSessionInfo(sessionInfo(), userInfo, 2, 2, {}, nullptr));
+  EXPECT_TRUE(sendLarge(3));
+  EXPECT_TRUE(send(sessionInfo(), 4)) << "a small one fits yet";
+  run();
+  for (size_t i = 0; i < 3; ++i) {
+    ASSERT_EQ(_kept.size(), i + 1);
+    answer(i);
+  }
+  EXPECT_EQ(categories(), (std::vector<int64_t>{1, 2, 4}));
+}
+
+TEST_F(OneShotSenderTest, hasRoomAgainAfterConnectionsThatEndWithoutAnAnswer) {
+  log().expectError("sendOneMessageWithSessionInfo: Failed to get remote object proxy");
+  daemon().stop();
+  for (int round = 0; round < 3; ++round) {
+    EXPECT_TRUE(sendLarge(1));
+    EXPECT_TRUE(sendLarge(2));
+    run();
+  }
+  EXPECT_TRUE(hasNoLine(log(), "Dropp"));
+  EXPECT_TRUE(hasLines(log(), 6, "sendOneMessageWithSessionInfo: XPC connection invalidated"));
+}
+
+TEST_F(OneShotSenderTest, opensOnlySoManyConnectionsToADaemonThatDoesNotAnswer) {
+  givenASilentDaemon();
+  constexpr size_t kMost = OneShotSender::kMaximumConnections;
+  for (size_t i = 0; i < kMost + 2; ++i) EXPECT_TRUE(send(sessionInfo()));
+  run();
+  _world.advance(std::chrono::seconds(10 * (kMost + 2)));
+  EXPECT_EQ(daemon().connectionCount(), kMost) << "each takes a descriptor of the host's";
+  answer(0);
+  EXPECT_EQ(daemon().connectionCount(), kMost + 1);
+  answer(1);
+  _world.advance(std::chrono::seconds(10));
+  EXPECT_EQ(daemon().connectionCount(), kMost + 2);
+  for (size_t i = 2; i < _kept.size(); ++i) answer(i);
+  EXPECT_EQ(daemon().endedConnectionCount(), kMost + 2);
 }
 
 TEST_F(OneShotSenderTest, logsAnAnswerThatIsNoTextAsAbsent) {

@@ -142,6 +142,19 @@ TEST_F(ReportingQueueTest, aDroppedNoticeIsNotADroppedEvent) {
   EXPECT_TRUE(hasLines(_process.log(), 1, "Dropped")) << "no line may speak of a dropped event";
 }
 
+TEST_F(ReportingQueueTest, dropsACallThatFindsNoRoomAndRunsOneThatFindsNothingBeforeIt) {
+  _process.log().expectError("Dropped 1 calls: more than 8388608 bytes were waiting to be handed to the daemon");
+  std::vector<int> run;
+  const uint64_t all = ReportingQueue::kMaximumWaitingBytes;
+  _queue->performCall([&run] { run.push_back(1); }, 2 * all);
+  EXPECT_EQ(run, std::vector<int>{1}) << "it does not wait, so it takes no room";
+  _queue->async([] {});
+  _queue->performCall([&run] { run.push_back(2); }, all);
+  _queue->performCall([&run] { run.push_back(3); }, 1);
+  _world.runUntilIdle();
+  EXPECT_EQ(run, (std::vector<int>{1, 2}));
+}
+
 // Many threads at once: nothing is lost, each thread's own order is kept, and no two steps overlap.
 TEST(ReportingQueueThreadsTest, keepsTheOrderOfEachThread) {
   constexpr int kThreads = 4;
