@@ -264,12 +264,17 @@ TEST_F(ClientProcessTest, theExampleReportsTheMetricsOfItsProcess) {
 
 TEST_F(ClientProcessTest, theExampleUpdatesBetweenItsReports) {
   givenDaemon();
-  const Outcome outcome = runProgram({TELVANE_PROGRAM_DIR "/report-metrics", "--seconds", "3", "--report-every", "2"},
+  const Outcome outcome = runProgram({TELVANE_PROGRAM_DIR "/report-metrics", "--seconds", "4", "--report-every", "2"},
                                      {"TELVANE_ROOT=" + _root.path(), "HOME=" + _root.path()});
   EXPECT_EQ(outcome.status, 0) << outcome.output;
-  ASSERT_EQ(categories(), std::vector<int64_t>{20});
-  const Dictionary event = *script().last(Operation::SendMessageWithDictionary).arguments[0].dictionary();
-  EXPECT_EQ((*event[kTelvaneMessageParametersPayload].dictionary())["samples"].array()->size(), 2u);
+  // How many there are is up to the machine; every one tells of two ticks.
+  ASSERT_FALSE(categories().empty()) << outcome.output;
+  for (const ScriptedDaemon::Call& call : script().calls()) {
+    if (call.operation != Operation::SendMessageWithDictionary) continue;
+    const Dictionary event = *call.arguments[0].dictionary();
+    EXPECT_EQ(event[kTelvaneMessageParametersCategory], Value(20));
+    EXPECT_EQ((*event[kTelvaneMessageParametersPayload].dictionary())["samples"].array()->size(), 2u);
+  }
 }
 
 TEST_F(ClientProcessTest, theExampleSaysWhatItTakes) {
