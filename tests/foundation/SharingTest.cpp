@@ -4,6 +4,7 @@
 #include <vector>
 
 #include "foundation/Value.h"
+#include "tests/foundation/AllocationCounter.h"
 
 namespace telvane::testing {
 namespace {
@@ -48,13 +49,18 @@ TEST(SharingTest, countsOwnersAcrossThreads) {
 }
 
 TEST(SharingTest, freesWhatTheLastThreadLetsGo) {
+  const int64_t before = livingAllocationCount();
   for (int round = 0; round < 200; ++round) {
-    Value value = Array{sharedValue(), sharedValue()};
-    std::vector<std::jthread> threads;
-    for (int i = 0; i < 2; ++i) {
-      threads.emplace_back([copy = value]() mutable { copy = Value(); });
+    {
+      Value value = Array{sharedValue(), sharedValue()};
+      EXPECT_GT(livingAllocationCount(), before);
+      std::vector<std::jthread> threads;
+      for (int i = 0; i < 2; ++i) {
+        threads.emplace_back([copy = value]() mutable { copy = Value(); });
+      }
+      value = Value();
     }
-    value = Value();
+    ASSERT_EQ(livingAllocationCount(), before) << "in round " << round;
   }
 }
 
