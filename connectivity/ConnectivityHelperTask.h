@@ -18,7 +18,6 @@ class ConnectivityHelperTask {
   ~ConnectivityHelperTask();
 
   RequestCompletion& completionHandler() noexcept { return _completionHandler; }
-  void setCompletionHandler(RequestCompletion completion) { _completionHandler = std::move(completion); }
   void appendReceivedData(const Data& data) { _receivedData.append(data.view()); }
   // Hands the body received so far over to the caller.
   Data takeReceivedData() { return Data(std::move(_receivedData)); }

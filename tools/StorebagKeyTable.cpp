@@ -1,7 +1,6 @@
 #include "tools/StorebagKeyTable.h"
 
 #include <algorithm>
-#include <array>
 #include <numeric>
 #include <vector>
 

@@ -8,8 +8,6 @@
 
 #include <cerrno>
 #include <filesystem>
-#include <optional>
-#include <vector>
 
 #include "platform/system/FileDescriptor.h"
 #include "platform/system/PlatformError.h"
