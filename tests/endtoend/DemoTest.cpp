@@ -77,8 +77,9 @@ TEST_F(DemoTest, showsThreeActsAndLeavesNothingBehind) {
               ContainsRegex("[1-9][0-9]* datagrams and acknowledgements got lost on the way; all 20 events are"));
   EXPECT_THAT(shown(), ContainsRegex("made [1-9][0-9]* reports, flushed\n"));
   EXPECT_THAT(shown(), ContainsRegex("\"process\":\\{.*\"residentKilobytes\":[1-9]"));
-  EXPECT_THAT(shown(),
-              ContainsRegex("1 log, 20 events on the dashboard and as many posts of them, [1-9][0-9]* reports of metrics"));
+  EXPECT_THAT(
+      shown(),
+      ContainsRegex("1 log, 20 events on the dashboard and as many posts of them, [1-9][0-9]* reports of metrics"));
   EXPECT_EQ(complaints(), "");
   EXPECT_THAT(leftFiles(), IsEmpty());
   EXPECT_THAT(leftProcesses(), IsEmpty());
