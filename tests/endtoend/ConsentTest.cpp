@@ -114,6 +114,7 @@ class ConsentFixture : public WireFixture {
       for (const uint32_t flag : kFlags) EXPECT_EQ(flags.count(flag), 2 * copies) << category << " with " << flag;
     }
     EXPECT_EQ(flagsArrived(kOneShot).size(), copies);
+    if (HasFailure()) std::cerr << instance().daemonLog();
   }
   const DatagramSocket& dashboard() const { return _dashboard; }
 
