@@ -120,8 +120,9 @@ TEST_F(TelvanedAgentLimitsTest, whatAHierarchySharesIsBounded) {
   const std::string most(900 << 10, 'x');
   const auto client = openSession(sessionInfoIn("a", 0));
   const auto keys = [this] {
+    const std::optional<Dictionary> shared = agent().sharedDataForSession(*sessions()[0]);
     std::string text;
-    for (const DictionaryEntry& entry : *agent().sharedDataForSession(*sessions()[0])) text += entry.key.view();
+    for (const DictionaryEntry& entry : shared.value_or(Dictionary())) text += entry.key.view();
     return text;
   };
   client->tell(kShare, {"a", Value(most)});
