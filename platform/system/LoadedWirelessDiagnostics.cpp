@@ -5,6 +5,7 @@
 
 #include <exception>
 #include <filesystem>
+#include <functional>
 #include <optional>
 #include <vector>
 
@@ -38,8 +39,8 @@ class ForeignCode {
   // Returns whether the call came back. function: its name.
   // What ends a thread is no C++ exception and has no object, so its reference is bound to nothing, and never looked
   // at.
-  template <class Call>
-  __attribute__((no_sanitize("null"))) bool call(std::string_view function, Call call) const {
+  __attribute__((no_sanitize("undefined"))) bool call(std::string_view function,
+                                                      const std::function<void()>& call) const {
     try {
       call();
       return true;
